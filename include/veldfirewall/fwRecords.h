@@ -28,6 +28,36 @@ enum FW_PORT_PROTOCOL : int32_t {
     FW_PROTO_IGMP = 32,
 };
 
+/// Values of FWRULE::ipType.
+enum FW_IP_TYPE : int32_t { FW_IP_TYPE_V4 = 0, FW_IP_TYPE_V6 = 1, FW_IP_TYPE_BOTH = 2 };
+
+/// Values of FWRULE::ipGroup: what FWRULE::ipList holds.
+enum FW_IP_GROUP : int32_t {
+    FW_IP_GROUP_ADDRESS = 0,  ///< {address}
+    FW_IP_GROUP_NETWORK = 1,  ///< {address, prefix length or mask}
+    FW_IP_GROUP_NONE = 2,     ///< nothing: the rule yields no command
+    FW_IP_GROUP_COUNTRY = 3,  ///< country codes
+    FW_IP_GROUP_RANGE = 4,    ///< {first address, last address}
+    FW_IP_GROUP_ANY = 5,      ///< any address of both families
+};
+
+/// Values of FWRULE::portGroup: what FWRULE::portList holds.
+enum FW_PORT_GROUP : int32_t {
+    FW_PORT_GROUP_SERVICE = 0,   ///< names of services
+    FW_PORT_GROUP_PORT = 1,      ///< ports "80" and ranges "1000-2000" of FWRULE::protocol
+    FW_PORT_GROUP_RESERVED = 2,  ///< names of services, in a rule that components keep for them
+    FW_PORT_GROUP_ANY = 3,       ///< any port and protocol
+};
+
+/// Adapter names that stand for no interface of that name: all interfaces, the PPPoE interface, the VPN interfaces.
+inline constexpr const char *FW_ADAPTER_GLOBAL = "global";
+inline constexpr const char *FW_ADAPTER_PPPOE = "pppoe";
+inline constexpr const char *FW_ADAPTER_VPN = "vpn";
+
+/// The chains of the table "filter" that belong to the firewall; INPUT and FORWARD jump to them.
+inline constexpr const char *FW_CHAIN_INPUT = "INPUT_FIREWALL";
+inline constexpr const char *FW_CHAIN_FORWARD = "FORWARD_FIREWALL";
+
 /// One rule of an adapter's list. The defaults are those of a new rule; the field names are the keys of a stored rule.
 struct FWRULE {
     int32_t ruleIndex = 0;      ///< number given by the document ("ruleID"); a stored rule's number is its position
@@ -38,16 +68,15 @@ struct FWRULE {
     std::vector<std::string> labelList;
     std::string name;
     std::string table = "filter";
-    std::set<std::string> chainList = {"FORWARD_FIREWALL", "INPUT_FIREWALL"};
-    int32_t ipType = 0;    ///< 0 IPv4 only, 1 IPv6 only, 2 both
-    int32_t ipDirect = 1;  ///< non-zero: source address; 0: destination
-    int32_t ipGroup = 0;   ///< 0 one address, 1 network, 2 none (yields no command), 3 countries, 4 range, 5 any
-    /// By ipGroup: {address}; {address, prefix or mask}; country codes; {first, last}.
+    std::set<std::string> chainList = {FW_CHAIN_FORWARD, FW_CHAIN_INPUT};
+    int32_t ipType = FW_IP_TYPE_V4;         ///< the families that get commands
+    int32_t ipDirect = 1;                   ///< non-zero: source address; 0: destination
+    int32_t ipGroup = FW_IP_GROUP_ADDRESS;  ///< kind of address match
     std::vector<std::string> ipList;
-    int32_t portDirect = 0;           ///< non-zero: source ports; 0: destination ports
-    int32_t portGroup = 0;            ///< 0 services, 1 explicit ports, 2 services reserved by a component, 3 any port
-    int32_t protocol = FW_PROTO_TCP;  ///< a FW_PORT_PROTOCOL number; read for portGroup 1
-    std::vector<std::string> portList;  ///< service names (portGroup 0, 2), or ports "80" and ranges "1000-2000" (1)
+    int32_t portDirect = 0;                     ///< non-zero: source ports; 0: destination ports
+    int32_t portGroup = FW_PORT_GROUP_SERVICE;  ///< kind of port match
+    int32_t protocol = FW_PROTO_TCP;            ///< a FW_PORT_PROTOCOL number; read for FW_PORT_GROUP_PORT
+    std::vector<std::string> portList;
 };
 
 /// One named rule set.
