@@ -1,0 +1,110 @@
+// SPDX-License-Identifier: Apache-2.0
+// Puts a recording program in the place of /sbin/iptables and /sbin/ip6tables.
+#include "commandRecorder.h"
+
+#include "files.h"
+#include "recordingProgram.h"
+#include "sandbox.h"
+
+#include <cstdio>
+#include <fstream>
+#include <sstream>
+#include <stdexcept>
+
+namespace veldtest {
+namespace {
+
+const std::string setAside = ".before-recording";
+
+/// Cuts at NUL; the last field is followed by one, too.
+std::vector<std::string> fieldsOf(const std::string &text) {
+    std::vector<std::string> fields;
+    std::istringstream in(text);
+    for (std::string field; std::getline(in, field, '\0');)
+        fields.push_back(field);
+    return fields;
+}
+
+}  // namespace
+
+std::string RecordedCommand::line() const {
+    std::string text = program;
+    for (const auto &argument : arguments)
+        text += " " + argument;
+    return text;
+}
+
+CommandRecorder::CommandRecorder(std::vector<std::string> programs) : m_programs(std::move(programs)) {
+    requireSandbox("replace programs");
+    makeDirectories(RECORDER_DIRECTORY, 0777);
+    clear();
+    for (const auto &program : m_programs) {
+        if (pathExists(program))
+            std::rename(program.c_str(), (program + setAside).c_str());
+        installProgram(VELD_RECORDING_PROGRAM, program);
+    }
+}
+
+CommandRecorder::~CommandRecorder() {
+    for (const auto &program : m_programs) {
+        std::remove(program.c_str());
+        if (pathExists(program + setAside))
+            std::rename((program + setAside).c_str(), program.c_str());
+    }
+}
+
+void CommandRecorder::addRule(const std::vector<std::string> &fields) {
+    std::ofstream out(RECORDER_RULES, std::ios::app | std::ios::binary);
+    for (const auto &field : fields)
+        out << field << '\0';
+    out.close();
+    if (!out)
+        throw std::runtime_error("cannot write " RECORDER_RULES);
+}
+
+void CommandRecorder::failAt(unsigned n, int status, const std::string &errorText) {
+    addRule({"at", std::to_string(n), std::to_string(status), errorText});
+}
+
+void CommandRecorder::failMatching(const std::string &part, int status, const std::string &errorText) {
+    addRule({"matching", part, std::to_string(status), errorText});
+}
+
+void CommandRecorder::setDelay(unsigned milliseconds) {
+    addRule({"delay", std::to_string(milliseconds), "0", ""});
+}
+
+std::vector<RecordedCommand> CommandRecorder::commands() const {
+    std::vector<RecordedCommand> result;
+    const auto fields = fieldsOf(readFile(RECORDER_RECORD));
+    for (size_t i = 0; i < fields.size();) {
+        // word count, handle count, words, handles
+        const size_t words = std::stoul(fields.at(i));
+        const size_t handles = std::stoul(fields.at(i + 1));
+        i += 2;
+        RecordedCommand command;
+        command.program = fields.at(i);
+        for (size_t word = 1; word < words; ++word)
+            command.arguments.push_back(fields.at(i + word));
+        i += words;
+        for (size_t handle = 0; handle < handles; ++handle)
+            command.inheritedHandles.push_back(std::stoi(fields.at(i + handle)));
+        i += handles;
+        result.push_back(command);
+    }
+    return result;
+}
+
+std::vector<std::string> CommandRecorder::lines() const {
+    std::vector<std::string> result;
+    for (const auto &command : commands())
+        result.push_back(command.line());
+    return result;
+}
+
+void CommandRecorder::clear() {
+    writeFile(RECORDER_RECORD, "", 0666);
+    writeFile(RECORDER_RULES, "", 0666);
+}
+
+}  // namespace veldtest

@@ -1,0 +1,12 @@
+/* SPDX-License-Identifier: Apache-2.0 */
+/* Files that the recording program and the recorder share, in the sandbox. */
+#ifndef VELD_TEST_RECORDING_PROGRAM_H
+#define VELD_TEST_RECORDING_PROGRAM_H
+
+#define RECORDER_DIRECTORY "/run/command-recorder"
+/* Per run, each field followed by NUL: word count, handle count, words (argv), open descriptors above 2. */
+#define RECORDER_RECORD RECORDER_DIRECTORY "/record"
+/* Per rule, each field followed by NUL: "at" | "matching" | "delay", its value, exit status, text for stderr. */
+#define RECORDER_RULES RECORDER_DIRECTORY "/rules"
+
+#endif

@@ -1,0 +1,55 @@
+// SPDX-License-Identifier: Apache-2.0
+// Receives what this process and its children send to the system log.
+#ifndef VELD_TEST_SYSTEM_LOG_H
+#define VELD_TEST_SYSTEM_LOG_H
+
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+namespace veldtest {
+
+/// One message. `text` is what the caller of syslog() wrote; `priority` is LOG_ERR etc. without the facility.
+struct LogMessage {
+    int priority;
+    std::string ident;
+    std::string text;
+};
+
+/// Listens on /dev/log of the sandbox as long as it lives. A thread of its own reads, because a sender waits when the
+/// socket's queue is full.
+class SystemLog {
+public:
+    SystemLog();
+    ~SystemLog();
+    SystemLog(const SystemLog &) = delete;
+    SystemLog &operator=(const SystemLog &) = delete;
+
+    /// All messages sent up to now, in order.
+    std::vector<LogMessage> messages();
+    /// Whether the text of a message holds `part`.
+    bool contains(const std::string &part);
+    /// How many messages have texts that hold `part`.
+    size_t count(const std::string &part);
+    /// All texts, a line each, for failure messages.
+    std::string text();
+    /// Forgets the messages sent up to now.
+    void clear();
+
+private:
+    void drain();  // with m_mutex held
+
+    int m_socket = -1;
+    int m_stop = -1;
+    std::mutex m_mutex;
+    std::vector<LogMessage> m_messages;
+    std::thread m_reader;
+};
+
+/// Splits a datagram as syslog() of the C library sends it: "<priority>Mmm dd hh:mm:ss ident[pid]: text".
+LogMessage parseLogDatagram(const std::string &datagram);
+
+}  // namespace veldtest
+
+#endif
