@@ -1,0 +1,69 @@
+# SPDX-License-Identifier: Apache-2.0
+# Short names for the usual jobs; what is built, and how, is in CMakePresets.json and the CMake files.
+SHELL := /bin/bash
+JOBS ?= $(shell nproc)
+PREFIX ?= /usr/local
+DESTDIR ?=
+FUZZ_SECONDS ?= 60
+
+# $(call build,<preset>[,<more configure options>]) configures and builds the preset in build-<preset>.
+build = cmake --preset $(1) --log-level=NOTICE $(2) && cmake --build --preset $(1) --parallel $(JOBS)
+
+.PHONY: help demo test bench lint format sanitize tsan fuzz install package clean
+.DEFAULT_GOAL := help
+
+help: ## list the targets
+	@sed -nE 's/^([a-z]+):.*## (.*)/  make \1\t\2/p' $(MAKEFILE_LIST) | expand -t 18
+
+demo: ## install what is needed, build, and show the firewall at work in a sandbox
+	scripts/install-dependencies.sh demo
+	$(call build,release)
+	scripts/demo.sh build-release
+
+test: ## install what is needed, build, and run all tests
+	scripts/install-dependencies.sh test
+	$(call build,dev)
+	ctest --preset dev --parallel $(JOBS)
+
+bench: ## measure; prints a table and writes out/bench.json
+	scripts/install-dependencies.sh bench
+	$(call build,bench)
+	mkdir -p out
+	build-bench/bench/veld_bench --benchmark_out=out/bench.json --benchmark_out_format=json
+
+lint: ## check format, static analysis (clang-tidy) and scripts
+	scripts/install-dependencies.sh lint
+	scripts/lint.sh
+	$(call build,tidy)
+
+format: ## rewrite the sources in the project's format
+	scripts/install-dependencies.sh lint
+	git ls-files -z '*.c' '*.cpp' '*.h' | xargs -0 clang-format -i
+
+sanitize: ## run the tests with AddressSanitizer and UndefinedBehaviorSanitizer
+	scripts/install-dependencies.sh test
+	$(call build,asan)
+	ctest --preset asan --parallel $(JOBS)
+
+tsan: ## run the tests with ThreadSanitizer
+	scripts/install-dependencies.sh test
+	$(call build,tsan)
+	ctest --preset tsan --parallel $(JOBS)
+
+fuzz: ## fuzz each target for FUZZ_SECONDS (60)
+	scripts/install-dependencies.sh fuzz
+	$(call build,fuzz)
+	scripts/fuzz.sh build-fuzz $(FUZZ_SECONDS)
+
+install: ## install below DESTDIR in PREFIX (/usr/local)
+	scripts/install-dependencies.sh build
+	$(call build,release,-DCMAKE_INSTALL_PREFIX=$(PREFIX))
+	DESTDIR=$(DESTDIR) cmake --install build-release
+
+package: ## build the Debian packages in out/packages
+	scripts/install-dependencies.sh package
+	$(call build,package)
+	cpack --preset package
+
+clean: ## remove everything that was built
+	rm -rf build-dev build-release build-asan build-tsan build-tidy build-bench build-fuzz build-package out
