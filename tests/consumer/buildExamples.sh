@@ -1,0 +1,76 @@
+#!/usr/bin/env bash
+# SPDX-License-Identifier: Apache-2.0
+# Installs a build into a fresh folder, moves that folder, and builds and starts the examples against it while the
+# source tree is hidden (an empty file system is mounted over it in a private mount namespace).
+#
+#   tests/consumer/buildExamples.sh find_package|pkg_config <source tree> <build tree>
+set -euo pipefail
+way=${1:?way} source_tree=${2:?source tree}
+
+expect() {  # expect <status> <text in the output> <command...>
+  local wanted=$1 text=$2 status=0 output
+  shift 2
+  output=$("$@" 2>&1) || status=$?
+  if [[ $status -ne $wanted || $output != *"$text"* ]]; then
+    printf '%s: status %d, expected %d and "%s"\n%s\n' "$*" "$status" "$wanted" "$text" "$output" >&2
+    exit 1
+  fi
+}
+
+try_examples() {  # try_examples <folder of blocked, profiles and readme>
+  expect 0 "usage: blocked" "$1/blocked" --help
+  expect 2 "usage: blocked" "$1/blocked"
+  expect 0 "usage: profiles" "$1/profiles" --help
+  expect 2 "usage: profiles" "$1/profiles" no-such-verb
+  expect 0 "libveldcore.so.1 => $PWD/installed" ldd "$1/readme"
+}
+
+with_find_package() {
+  local example
+  for example in c cpp readme; do
+    cmake -S "examples/$example" -B "built/$example" -DCMAKE_PREFIX_PATH="$PWD/installed" --log-level=NOTICE
+    cmake --build "built/$example"
+  done
+  mkdir bin
+  cp built/c/blocked built/cpp/profiles built/readme/readme bin
+  try_examples bin
+}
+
+with_pkg_config() {
+  local pc flags strict=(-Wall -Wextra -Wpedantic -Werror)
+  pc=$(find installed -name veldfirewall.pc)
+  PKG_CONFIG_PATH=$PWD/$(dirname "$pc")
+  export PKG_CONFIG_PATH
+  read -ra flags <<<"$(pkg-config --cflags --libs veldfirewall)"
+  mkdir bin
+  "${CC:-cc}" -std=c11 "${strict[@]}" -o bin/blocked examples/c/blocked.c "${flags[@]}"
+  "${CXX:-c++}" -std=c++17 "${strict[@]}" -o bin/profiles examples/cpp/profiles.cpp "${flags[@]}"
+  "${CXX:-c++}" -std=c++17 "${strict[@]}" -o bin/readme examples/readme/readme.cpp "${flags[@]}"
+  LD_LIBRARY_PATH=$(pkg-config --variable=libdir veldfirewall)
+  export LD_LIBRARY_PATH
+  try_examples bin
+}
+
+if [[ ${3:-} == hidden ]]; then  # second call, in the namespace, in the work folder
+  mount -t tmpfs none "$source_tree"
+  [[ ! -e $source_tree/CMakeLists.txt ]]
+  "with_$way"
+  exit
+fi
+
+build_tree=${3:?build tree}
+work=$(mktemp -d)
+trap 'rm -rf "$work"' EXIT
+cmake --install "$build_tree" --prefix "$work/first" >"$work/install.log" || { cat "$work/install.log"; exit 1; }
+mv "$work/first" "$work/installed"
+cp -r "$source_tree/examples" "${BASH_SOURCE[0]}" "$work"
+mkdir "$work/examples/readme"
+awk '/^```cpp$/ {inside = 1; next} /^```$/ {if (inside) exit} inside' "$source_tree/README.md" \
+  >"$work/examples/readme/readme.cpp"
+sed -e 's/veld_profiles/veld_readme/' -e 's/profiles/readme/g' "$source_tree/examples/cpp/CMakeLists.txt" \
+  >"$work/examples/readme/CMakeLists.txt"
+
+namespace=(unshare --mount)
+[[ $EUID -eq 0 ]] || namespace+=(--user --map-root-user)
+cd "$work"
+"${namespace[@]}" bash "$work/${BASH_SOURCE[0]##*/}" "$way" "$source_tree" hidden
