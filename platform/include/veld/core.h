@@ -9,6 +9,8 @@
 extern "C" {
 #endif
 
+#pragma GCC visibility push(default)
+
 /* Runs the program at `path` without a shell. argv ends with NULL. With `wait` 1: 0 when it exits with status 0, -1
  * when it cannot be started, exits otherwise or is killed. With `wait` 0: 0 when it could be started, -1 otherwise. */
 int VLIBCExecv(const char *path, char *const argv[], int wait);
@@ -60,6 +62,8 @@ int VLIBCErrorGetLine(void);
 
 /* 1 when the system has the capability `key`, else 0. */
 int VLIBCSupportGet(const char *key);
+
+#pragma GCC visibility pop
 
 #ifdef __cplusplus
 }

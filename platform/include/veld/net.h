@@ -9,6 +9,8 @@
 extern "C" {
 #endif
 
+#pragma GCC visibility push(default)
+
 typedef struct VLIBNetInterfaceInfo {
     char szName[IF_NAMESIZE]; /* NUL-terminated; must stay the first member */
     int index;                /* kernel index */
@@ -27,6 +29,8 @@ int BlVLIBIsv6IpAddrValid(const char *text);
 
 /* Writes the name of the interface that carries PPPoE: its length, or negative when there is none. */
 int VELDPPPoeIntfGet(char *buf, int size);
+
+#pragma GCC visibility pop
 
 #ifdef __cplusplus
 }

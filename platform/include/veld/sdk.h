@@ -9,6 +9,8 @@
 extern "C" {
 #endif
 
+#pragma GCC visibility push(default)
+
 /* Creates the directory with its parents; one that exists is success. 0, or -1 with errno. */
 int VELDFSMkdirP(const char *path, mode_t mode);
 
@@ -26,6 +28,8 @@ int VLIBPluginSetArg(VLIBPLUGIN_HANDLE handle, const char *key, const char *valu
 int VLIBPluginAction(int code, VLIBPLUGIN_HANDLE handle);
 /* Closes the handle; NULL is allowed. */
 void VLIBPluginExit(VLIBPLUGIN_HANDLE handle);
+
+#pragma GCC visibility pop
 
 #ifdef __cplusplus
 }

@@ -9,6 +9,8 @@
 extern "C" {
 #endif
 
+#pragma GCC visibility push(default)
+
 /* Protocols of a port list. */
 #define VELDFW_SERVICE_TCP 1
 #define VELDFW_SERVICE_UDP 2
@@ -34,6 +36,8 @@ int VELDFwServiceEnum(VELDFWSERVICE_HANDLE *handle);
 const VELDFWSERVICE *VELDFWServiceFind(VELDFWSERVICE_HANDLE handle, const char *name);
 /* Frees the registry and its records; NULL is allowed. */
 void VELDFwServiceFree(VELDFWSERVICE_HANDLE handle);
+
+#pragma GCC visibility pop
 
 #ifdef __cplusplus
 }
