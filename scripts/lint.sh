@@ -14,6 +14,10 @@ mapfile -d '' sources < <(tracked '*.c' '*.cpp' '*.h')
 mapfile -d '' scripts < <(tracked '*.sh' .ci/run)
 mapfile -d '' all < <(tracked .)
 faults=0
+if [[ ${#sources[@]} -eq 0 || ${#scripts[@]} -eq 0 ]]; then  # no Git, or a tree that it does not trust
+  echo "${0##*/}: the tracked files cannot be listed" >&2
+  exit 1
+fi
 
 clang-format --dry-run -Werror "${sources[@]}" || faults=1
 shellcheck "${scripts[@]}" || faults=1

@@ -1,0 +1,37 @@
+# SPDX-License-Identifier: Apache-2.0
+# The Debian packages, one per install component (make package).
+set(CPACK_GENERATOR DEB)
+set(CPACK_COMPONENTS_ALL library platform development)
+set(CPACK_PACKAGE_VENDOR "${PROJECT_NAME}")
+set(CPACK_PACKAGE_CONTACT "The ${PROJECT_NAME} developers <veldfirewall@localhost>")
+set(CPACK_PACKAGE_VERSION ${PROJECT_VERSION})
+set(CPACK_STRIP_FILES ON)
+set(CPACK_RESOURCE_FILE_LICENSE ${PROJECT_SOURCE_DIR}/LICENSE)
+
+set(CPACK_DEB_COMPONENT_INSTALL ON)
+set(CPACK_DEBIAN_ENABLE_COMPONENT_DEPENDS OFF)
+set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
+set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS ON)
+set(CPACK_DEBIAN_PACKAGE_GENERATE_SHLIBS ON)
+set(CPACK_DEBIAN_PACKAGE_GENERATE_SHLIBS_POLICY >=)
+set(CPACK_DEBIAN_PACKAGE_CONTROL_STRICT_PERMISSION ON)
+# Where dpkg-shlibdeps finds the libraries of the other packages before they are installed.
+set(CPACK_DEBIAN_PACKAGE_SHLIBDEPS_PRIVATE_DIRS ${PROJECT_BINARY_DIR}/platform/linux ${PROJECT_BINARY_DIR}/src)
+
+# veld_package(<component> <package> <section> <summary> <depends>)
+macro(veld_package component package section summary depends)
+  string(TOUPPER ${component} upper)
+  set(CPACK_DEBIAN_${upper}_PACKAGE_NAME ${package})
+  set(CPACK_DEBIAN_${upper}_PACKAGE_SECTION ${section})
+  set(CPACK_DEBIAN_${upper}_DESCRIPTION "${summary}")
+  set(CPACK_DEBIAN_${upper}_PACKAGE_DEPENDS "${depends}")
+endmacro()
+
+set(same_version "(= ${PROJECT_VERSION})")
+veld_package(library libveldfirewall1 libs "${PROJECT_DESCRIPTION}"
+  "libveldplatform1 (>= ${PROJECT_VERSION}), iptables")
+veld_package(platform libveldplatform1 libs "Stand-ins for the storage appliance's system libraries" "")
+veld_package(development libveldfirewall-dev libdevel "${PROJECT_DESCRIPTION} (development files)"
+  "libveldfirewall1 ${same_version}, libveldplatform1 ${same_version}, libjsoncpp-dev, pkg-config")
+
+include(CPack)
