@@ -1,11 +1,12 @@
 # SPDX-License-Identifier: Apache-2.0
 # The Debian packages, one per install component (make package).
 set(CPACK_GENERATOR DEB)
-set(CPACK_COMPONENTS_ALL library platform development)
+set(CPACK_COMPONENTS_ALL Library Runtime Development)
 set(CPACK_PACKAGE_VENDOR "${PROJECT_NAME}")
 set(CPACK_PACKAGE_CONTACT "The ${PROJECT_NAME} developers <veldfirewall@localhost>")
 set(CPACK_PACKAGE_VERSION ${PROJECT_VERSION})
 set(CPACK_STRIP_FILES ON)
+set(CPACK_SET_DESTDIR ON)  # some places are absolute; they must be staged too
 set(CPACK_RESOURCE_FILE_LICENSE ${PROJECT_SOURCE_DIR}/LICENSE)
 
 set(CPACK_DEB_COMPONENT_INSTALL ON)
@@ -28,10 +29,10 @@ macro(veld_package component package section summary depends)
 endmacro()
 
 set(same_version "(= ${PROJECT_VERSION})")
-veld_package(library libveldfirewall1 libs "${PROJECT_DESCRIPTION}"
+veld_package(Library libveldfirewall1 libs "${PROJECT_DESCRIPTION}"
   "libveldplatform1 (>= ${PROJECT_VERSION}), iptables")
-veld_package(platform libveldplatform1 libs "Stand-ins for the storage appliance's system libraries" "")
-veld_package(development libveldfirewall-dev libdevel "${PROJECT_DESCRIPTION} (development files)"
+veld_package(Runtime libveldplatform1 libs "Stand-ins for the storage appliance's system libraries" "")
+veld_package(Development libveldfirewall-dev libdevel "${PROJECT_DESCRIPTION} (development files)"
   "libveldfirewall1 ${same_version}, libveldplatform1 ${same_version}, libjsoncpp-dev, pkg-config")
 
 include(CPack)

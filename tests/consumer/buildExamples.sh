@@ -61,8 +61,10 @@ fi
 build_tree=${3:?build tree}
 work=$(mktemp -d)
 trap 'rm -rf "$work"' EXIT
-cmake --install "$build_tree" --prefix "$work/first" >"$work/install.log" || { cat "$work/install.log"; exit 1; }
-mv "$work/first" "$work/installed"
+# DESTDIR, because the network tool's place is absolute.
+DESTDIR=$work/stage cmake --install "$build_tree" --prefix /first >"$work/install.log" ||
+  { cat "$work/install.log"; exit 1; }
+mv "$work/stage/first" "$work/installed"
 cp -r "$source_tree/examples" "${BASH_SOURCE[0]}" "$work"
 mkdir "$work/examples/readme"
 awk '/^```cpp$/ {inside = 1; next} /^```$/ {if (inside) exit} inside' "$source_tree/README.md" \
