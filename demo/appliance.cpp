@@ -4,6 +4,7 @@
 
 #include "files.h"
 #include "processes.h"
+#include "sandbox.h"
 
 #include <veldfirewall/veldFW.h>
 
@@ -40,6 +41,7 @@ FW::FWRULE denyAddress(const std::string &name, int ipType, const std::string &a
 }  // namespace
 
 void installBuild(const std::string &buildDirectory) {
+    veldtest::requireSandbox("install the build");
     veldtest::runChecked({"cmake", "--install", buildDirectory, "--prefix", "/tmp/veldfirewall"});
     for (const auto &name : veldtest::listDirectory(shippedProfiles)) {
         if (!veldtest::pathExists(profiles + name))

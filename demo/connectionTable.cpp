@@ -4,6 +4,7 @@
 
 #include <veldfirewall/veldFW.h>
 
+#include <array>
 #include <cstdio>
 #include <map>
 #include <stdexcept>
@@ -61,15 +62,15 @@ std::vector<Row> makeRows(const veldtest::NetworkNamespace &client, const FW::FW
     std::vector<Row> rows;
     for (const auto *family : {&addressesV4, &addressesV6}) {
         const std::vector<Row> added = {
-            {family, "allowed port, from outside", family->outside, tcp, portHttps, allow, true, {}, {}, {}},
-            {family, "denied port, from the local network", family->local, tcp, portTelnet, deny, false, {}, {}, {}},
-            {family, "file sharing, from the local network", family->local, tcp, portSmb, partial, true, {}, {}, {}},
-            {family, "file sharing, from a denied address", family->denied, tcp, portSmb, partial, false, {}, {}, {}},
-            {family, "file sharing, from outside", family->outside, tcp, portSmb, partial, false, {}, {}, {}},
-            {family, "name service, from the local network", family->local, udp, portDns, partial, true, {}, {}, {}},
-            {family, "name service, from outside", family->outside, udp, portDns, partial, false, {}, {}, {}},
+            {family, "allowed port", family->outside, tcp, portHttps, allow, true, {}, {}, {}},
+            {family, "denied port", family->local, tcp, portTelnet, deny, false, {}, {}, {}},
+            {family, "file sharing", family->local, tcp, portSmb, partial, true, {}, {}, {}},
+            {family, "file sharing", family->denied, tcp, portSmb, partial, false, {}, {}, {}},
+            {family, "file sharing", family->outside, tcp, portSmb, partial, false, {}, {}, {}},
+            {family, "name service", family->local, udp, portDns, partial, true, {}, {}, {}},
+            {family, "name service", family->outside, udp, portDns, partial, false, {}, {}, {}},
             {family,
-             "established, on the denied port",
+             "session since before",
              family->local,
              tcp,
              portTelnet,
@@ -91,38 +92,64 @@ void observe(std::vector<Row> &rows, const veldtest::NetworkNamespace &client) {
         row.observations.push_back({askLibrary(row), askNetwork(row, client)});
 }
 
+namespace {
+
+/// Expected against seen, of one row. @return number of differences
+int countWrong(const Row &row) {
+    int wrong = 0;
+    for (size_t i = 0; i < row.observations.size(); ++i) {
+        const bool on = static_cast<Phase>(i) == Phase::enabled;
+        const auto &seen = row.observations[i];
+        const auto network = !on || row.connects ? veldtest::ProbeResult::connected : veldtest::ProbeResult::timedOut;
+        wrong += seen.network != network ? 1 : 0;
+        wrong += seen.verdict != (on ? row.verdict : FW::FW_POLICY_ALLOW) ? 1 : 0;
+    }
+    // A lasting connection is let through before any rule of the profile is asked.
+    if (contradict(row.verdict, row.decision) || (!row.lasting && row.decision.allowed != row.connects))
+        ++wrong;
+    return wrong;
+}
+
+/// One line of the table; also the head, so that the columns agree.
+void printLine(const std::array<std::string, 10> &cells) {
+    constexpr std::array<int, 10> widths = {23, 7, 7, 6, 9, 6, 30, 9, 9, 9};
+    for (size_t i = 0; i < cells.size(); ++i)
+        std::printf("%s%-*s", i == 3 || i == 7 ? " | " : "  ", widths.at(i), cells.at(i).c_str());
+    std::printf("\n");
+}
+
+void printFamily(const Addresses &family) {
+    std::printf("\n  %s: appliance %s; client local %s, denied %s, outside %s\n",
+                &family == &addressesV4 ? "IPv4" : "IPv6", family.appliance, family.local, family.denied,
+                family.outside);
+    printLine({"", "", "", "the profile says", "", "", "", "the network did", "", ""});
+    printLine(
+        {"connection", "from", "port", "before", "enabled", "after", "deciding rule", "before", "enabled", "after"});
+}
+
+std::string sourceName(const Row &row) {
+    return row.source == row.addresses->local ? "local" : row.source == row.addresses->denied ? "denied" : "outside";
+}
+
+}  // namespace
+
 int printTable(const std::vector<Row> &rows) {
     int wrong = 0;
     const Addresses *family = nullptr;
-    const char *const format = "  %-37s %-15s %-8s| %-9s -> %-11s| %-9s %-30s -> %-11s| %-9s -> %-11s%s\n";
     for (const auto &row : rows) {
-        if (row.addresses != family) {
-            family = row.addresses;
-            std::printf("\n  %s, to %s\n", family == &addressesV4 ? "IPv4" : "IPv6", family->appliance);
-            std::printf("  %-62s| %-24s| %-55s| %s\n", "", "before", "while enabled", "after disabling");
-            std::printf(format, "connection", "from", "port", "profile", "network", "profile", "deciding rule",
-                        "network", "profile", "network", "");
-        }
-        int wrongHere = 0;
-        for (size_t i = 0; i < row.observations.size(); ++i) {
-            const bool on = static_cast<Phase>(i) == Phase::enabled;
-            const auto &seen = row.observations[i];
-            const auto network =
-                !on || row.connects ? veldtest::ProbeResult::connected : veldtest::ProbeResult::timedOut;
-            wrongHere += seen.network != network ? 1 : 0;
-            wrongHere += seen.verdict != (on ? row.verdict : FW::FW_POLICY_ALLOW) ? 1 : 0;
-        }
-        // A lasting connection is let through before any rule is asked.
-        const bool kept = row.lasting != nullptr;
-        if (contradict(row.verdict, row.decision) || (!kept && row.decision.allowed != row.connects))
-            ++wrongHere;
-        const auto rule = kept ? "established traffic" : row.decision.rule;
+        if (row.addresses != family)
+            printFamily(*(family = row.addresses));
+        const int wrongHere = countWrong(row);
         const std::string port = std::to_string(row.port) + (row.protocol == FW::FW_PROTO_UDP ? "/udp" : "/tcp");
+        // The sign is what the rule does to a new connection.
+        const std::string decision =
+            row.lasting ? "+ established traffic" : (row.decision.allowed ? "+ " : "- ") + row.decision.rule;
         const auto &seen = row.observations;
-        std::printf(format, row.title, row.source, port.c_str(), toText(seen.at(0).verdict),
-                    veldtest::toText(seen.at(0).network), toText(seen.at(1).verdict), rule.c_str(),
-                    veldtest::toText(seen.at(1).network), toText(seen.at(2).verdict),
-                    veldtest::toText(seen.at(2).network), wrongHere > 0 ? " <-- NOT AS EXPECTED" : "");
+        printLine({row.title, sourceName(row), port, toText(seen.at(0).verdict), toText(seen.at(1).verdict),
+                   toText(seen.at(2).verdict), decision, veldtest::toText(seen.at(0).network),
+                   veldtest::toText(seen.at(1).network), veldtest::toText(seen.at(2).network)});
+        if (wrongHere > 0)
+            std::printf("  ^^^ %d results of this line are NOT AS EXPECTED\n", wrongHere);
         wrong += wrongHere;
     }
     return wrong;

@@ -133,7 +133,7 @@ int runScenario(const std::string &buildDirectory, const std::function<void(cons
     const auto profile = editProfile();
     printProfile(profile);
 
-    const veldtest::EchoServer server({portTelnet, portDns, portHttps, portSmb});
+    const veldtest::EchoServer server({portTelnet, portDns, portHttps, portSmb}, nullptr, true);
     auto rows = makeRows(client, profile);
     printHeading("Trying all connections before");
     observe(rows, client);
@@ -156,6 +156,12 @@ int runScenario(const std::string &buildDirectory, const std::function<void(cons
     wrong += checkLog(log);
 
     printHeading("What the profile says of each port and what the network did");
+    std::printf(
+        "  + allows, - denies; \"by source\": open for some source addresses only. The session exists since before "
+        "the\n"
+        "  firewall was enabled, on the denied port; the appliance sends on it, too. (A session on which only the\n"
+        "  client sends, and that is older than the first rule that asks for connection states, is unknown to the\n"
+        "  kernel's connection tracking; it is judged as a new one.)\n");
     wrong += printTable(rows);
     return wrong;
 }

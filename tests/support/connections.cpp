@@ -205,7 +205,8 @@ bool echoStream(int handle) {
     return count > 0 && send(handle, buffer.data(), static_cast<size_t>(count), MSG_NOSIGNAL) == count;
 }
 
-[[noreturn]] void serve(const std::vector<int> &listeners, const std::vector<int> &datagrams) {
+[[noreturn]] void serve(const std::vector<int> &listeners, const std::vector<int> &datagrams, bool talking) {
+    constexpr int talkInterval = 50;  // milliseconds
     std::vector<pollfd> entries;
     for (const int handle : listeners)
         entries.push_back({handle, POLLIN, 0});
@@ -213,8 +214,14 @@ bool echoStream(int handle) {
         entries.push_back({handle, POLLIN, 0});
     const size_t fixed = entries.size();
     for (;;) {
-        if (poll(entries.data(), entries.size(), -1) < 0)
+        const int ready = poll(entries.data(), entries.size(), talking ? talkInterval : -1);
+        if (ready < 0)
             continue;
+        if (ready == 0) {
+            for (size_t i = fixed; i < entries.size(); ++i)
+                send(entries[i].fd, "news\n", 5, MSG_NOSIGNAL);
+            continue;
+        }
         std::vector<pollfd> accepted;
         for (size_t i = 0; i < entries.size(); ++i) {
             auto &entry = entries[i];
@@ -304,7 +311,7 @@ ProbeResult Connection::exchange(milliseconds timeout) {
     return ProbeResult::connected;
 }
 
-EchoServer::EchoServer(const std::vector<uint16_t> &ports, const NetworkNamespace *space) {
+EchoServer::EchoServer(const std::vector<uint16_t> &ports, const NetworkNamespace *space, bool talking) {
     requireSandbox("serve ports");
     std::vector<int> listeners;
     std::vector<int> datagrams;
@@ -315,7 +322,7 @@ EchoServer::EchoServer(const std::vector<uint16_t> &ports, const NetworkNamespac
             datagrams.push_back(openServerSocket(SOCK_DGRAM, port));
         }
     });
-    m_process = startChild([&]() -> int { serve(listeners, datagrams); });
+    m_process = startChild([&]() -> int { serve(listeners, datagrams, talking); });
     for (const int handle : listeners)
         close(handle);
     for (const int handle : datagrams)

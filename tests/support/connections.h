@@ -62,7 +62,9 @@ private:
 /// sandbox's own namespace. Ready when the constructor returns; killed by the destructor.
 class EchoServer {
 public:
-    explicit EchoServer(const std::vector<uint16_t> &ports, const NetworkNamespace *space = nullptr);
+    /// @param talking sends a line to every TCP connection several times a second, as a server with news would
+    explicit EchoServer(const std::vector<uint16_t> &ports, const NetworkNamespace *space = nullptr,
+                        bool talking = false);
     ~EchoServer();
     EchoServer(const EchoServer &) = delete;
     EchoServer &operator=(const EchoServer &) = delete;
