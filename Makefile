@@ -6,8 +6,8 @@ PREFIX ?= /usr/local
 DESTDIR ?=
 FUZZ_SECONDS ?= 60
 
-# $(call build,<preset>[,<more configure options>]) configures and builds the preset in build-<preset>.
-build = cmake --preset $(1) --log-level=NOTICE $(2) && cmake --build --preset $(1) --parallel $(JOBS)
+# $(call build,<preset>[,<configure options>[,<build options>]]) configures and builds the preset in build-<preset>.
+build = cmake --preset $(1) --log-level=NOTICE $(2) && cmake --build --preset $(1) --parallel $(JOBS) $(3)
 
 .PHONY: help demo test bench lint format sanitize tsan fuzz install package clean
 .DEFAULT_GOAL := help
@@ -34,7 +34,7 @@ bench: ## measure; prints a table and writes out/bench.json
 lint: ## check format, static analysis (clang-tidy) and scripts
 	scripts/install-dependencies.sh lint
 	scripts/lint.sh
-	$(call build,tidy)
+	$(call build,tidy,,-- -k 0)
 
 format: ## rewrite the sources in the project's format
 	scripts/install-dependencies.sh lint
