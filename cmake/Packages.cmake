@@ -1,7 +1,7 @@
 # SPDX-License-Identifier: Apache-2.0
 # The Debian packages, one per install component (make package).
 set(CPACK_GENERATOR DEB)
-set(CPACK_COMPONENTS_ALL Library Runtime Development)
+set(CPACK_COMPONENTS_ALL Library Runtime Development data)
 set(CPACK_PACKAGE_VENDOR "${PROJECT_NAME}")
 set(CPACK_PACKAGE_CONTACT "The ${PROJECT_NAME} developers <veldfirewall@localhost>")
 set(CPACK_PACKAGE_VERSION ${PROJECT_VERSION})
@@ -30,9 +30,11 @@ endmacro()
 
 set(same_version "(= ${PROJECT_VERSION})")
 veld_package(Library libveldfirewall1 libs "${PROJECT_DESCRIPTION}"
-  "libveldplatform1 (>= ${PROJECT_VERSION}), iptables")
+  "libveldplatform1 (>= ${PROJECT_VERSION}), veldfirewall-common (>= ${PROJECT_VERSION}), iptables")
 veld_package(Runtime libveldplatform1 libs "Stand-ins for the storage appliance's system libraries" "")
 veld_package(Development libveldfirewall-dev libdevel "${PROJECT_DESCRIPTION} (development files)"
   "libveldfirewall1 ${same_version}, libveldplatform1 ${same_version}, libjsoncpp-dev, pkg-config")
+veld_package(data veldfirewall-common admin "Profile, service definitions and module list of the firewall" "")
+set(CPACK_DEBIAN_DATA_PACKAGE_ARCHITECTURE all)
 
 include(CPack)
