@@ -13,6 +13,7 @@
 #include "fw/blockQuery.h"
 #include "fw/builtinChains.h"
 #include "fw/commandLine.h"
+#include "fw/commandList.h"
 #include "fw/ruleListEdit.h"
 #include "fw/serviceRegistry.h"
 #include "settings/fwSettings.h"
@@ -26,8 +27,6 @@ namespace FW {
 
 namespace {
 
-constexpr const char *IPTABLES = "/sbin/iptables";
-constexpr const char *IP6TABLES = "/sbin/ip6tables";
 constexpr std::array<const char *, 2> FIREWALL_CHAINS = {FW_CHAIN_INPUT, FW_CHAIN_FORWARD};
 
 constexpr const char *MODULE_OWNER = "firewall";
@@ -281,28 +280,10 @@ bool VELDFW::cmdExec(const std::string &commandLine) {
 }
 
 bool VELDFW::fwExec(Json::Value commandList) {
-    const auto groupRun = [this](const char *program, const Json::Value &group) {
-        for (const Json::Value &arguments : group) {
-            const std::string commandLine = std::string(program) + " " + arguments.asString();
-            if (!cmdExec(commandLine)) {
-                FW_LOG_ERR("Failed to execute \"%s\"", commandLine.c_str());
-                return false;
-            }
-        }
-        return true;
-    };
-    for (const auto &[program, family] : {std::pair(IPTABLES, "v4"), std::pair(IP6TABLES, "v6")}) {
-        if (!commandList.isMember(family)) {
-            continue;
-        }
-        const Json::Value &section = commandList[family];
-        if (section.isMember("global") && !groupRun(program, section["global"])) {
+    for (const ListedCommand &command : commandsInOrder(commandList)) {
+        if (!cmdExec(command.commandLine)) {
+            FW_LOG_ERR("Failed to execute \"%s\"", command.commandLine.c_str());
             return false;
-        }
-        for (auto group = section.begin(); group != section.end(); ++group) {
-            if (group.name() != "global" && !groupRun(program, *group)) {
-                return false;
-            }
         }
     }
     return true;
@@ -402,7 +383,7 @@ bool VELDFW::fwReload(bool keepEstablished) {
 bool VELDFW::fwClear() {
     bool cleared = true;
     for (const char *chain : FIREWALL_CHAINS) {
-        for (const char *program : {IPTABLES, IP6TABLES}) {
+        for (const char *program : {IPTABLES_PROGRAM, IP6TABLES_PROGRAM}) {
             const std::string commandLine = std::string(program) + " -F " + chain;
             if (!cmdExec(commandLine)) {
                 FW_LOG_ERR("Failed to execute \"%s\"", commandLine.c_str());
