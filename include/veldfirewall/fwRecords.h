@@ -101,6 +101,18 @@ struct PortCompareST {
     std::string port;  ///< "80" or "1000-2000"
 };
 
+/// What stopped an atomic apply (VELDFW::fwReloadAtomic(), VELDFW::fwExecAtomic()).
+struct FwApplyFailure {
+    std::string profile;  ///< profile that was to be applied; empty for a bare command list
+    std::string adapter;  ///< group of the command list; empty when no single command is to blame
+    int32_t rulePosition =
+        -1;                ///< position in the adapter's rules from 0; -1: none of the profile's own rules, or unknown
+    std::string ruleName;  ///< name of that rule
+    std::string family;    ///< "v4" or "v6"; empty when neither is to blame
+    std::string command;   ///< the whole command, program first; empty when no single command is to blame
+    std::string message;   ///< what the program said, or why the command was not handed to it
+};
+
 }  // namespace FW
 
 #endif

@@ -49,6 +49,17 @@ public:
     /// first, then the others in byte order. Stops at the first command that fails; those before it stay in effect.
     bool fwExec(Json::Value commandList);
 
+    /// Applies a command list as a whole: replaces the rules of both firewall chains, in one transaction per family,
+    /// through iptables-restore and ip6tables-restore; families that the list does not have, other chains and the
+    /// built-in policies are left alone. Rules of tables other than "filter" are appended there. Both families are
+    /// tried first; when the second cannot be committed, the first is put back. Takes no lock.
+    /// @param commandList appends only; a command that the two kinds of program would read differently is refused
+    /// @param failure what stopped it; untouched on success
+    /// @return true: everything is new; false, logged: everything is as it was
+    bool fwExecAtomic(const Json::Value &commandList, FwApplyFailure &failure);
+    /// The same for callers to whom the log is enough.
+    bool fwExecAtomic(const Json::Value &commandList);
+
     // Lifecycle
 
     /// Loads the kernel modules, announces the switch (hooks), stores it and applies the active profile.
@@ -62,6 +73,12 @@ public:
     /// a command is refused switches the firewall off.
     /// @param keepEstablished accept packets of established connections
     bool fwReload(bool keepEstablished);
+    /// As fwReload(), but as a whole (fwExecAtomic()): no moment without rules, the built-in policies are never
+    /// touched, and after a failure the old rules stay in force and the firewall stays on.
+    /// @param failure what stopped it; untouched on success
+    bool fwReloadAtomic(bool keepEstablished, FwApplyFailure &failure);
+    /// The same for callers to whom the log is enough.
+    bool fwReloadAtomic(bool keepEstablished);
     /// Flushes both firewall chains of both families; goes on past a failure.
     bool fwClear();
     /// Sets the policy of the built-in INPUT and FORWARD chains of both families to DROP.

@@ -14,6 +14,8 @@
 #include "fw/builtinChains.h"
 #include "fw/commandLine.h"
 #include "fw/commandList.h"
+#include "fw/execLock.h"
+#include "fw/firewallModules.h"
 #include "fw/ruleListEdit.h"
 #include "fw/serviceRegistry.h"
 #include "settings/fwSettings.h"
@@ -32,46 +34,9 @@ constexpr std::array<const char *, 2> FIREWALL_CHAINS = {FW_CHAIN_INPUT, FW_CHAI
 constexpr const char *MODULE_OWNER = "firewall";
 const std::vector<std::string> FIREWALL_MODULES = {"compat_xtables.ko", "xt_geoip.ko", "xt_mac.ko"};
 
-constexpr const char *EXEC_LOCK_FILE = "/tmp/firewall_iptables_exec.lock";
-constexpr int EXCLUSIVE = 1;
-constexpr int LOCK_SECONDS = 30;
 constexpr int WAIT = 1;
 
 constexpr const char *TEST_PREFIX = ".test_";
-
-/// Keeps other processes from changing the kernel's rules.
-class ExecLock {
-public:
-    ExecLock() : taken(VLIBCFileLockTimeByFile(EXEC_LOCK_FILE, EXCLUSIVE, LOCK_SECONDS, &descriptor) != 0) {}
-    ~ExecLock() {
-        if (taken && descriptor >= 0 && VLIBCFileUnlockByFile(descriptor) == 0) {
-            FW_LOG_ERR("Failed to unlock");
-        }
-    }
-    ExecLock(const ExecLock &) = delete;
-    ExecLock &operator=(const ExecLock &) = delete;
-
-    bool isTaken() const { return taken; }
-
-private:
-    int descriptor = -1;
-    bool taken;
-};
-
-bool firewallModLoad() {
-    if (VELD_IPTABLES_MODULES::isModuleLoad(MODULE_OWNER)) {
-        return true;
-    }
-    if (!VELD_IPTABLES_MODULES::iptablesCoreModLoad(MODULE_OWNER)) {
-        FW_LOG_ERR("Failed to iptablesCoreModLoad");
-        return false;
-    }
-    if (!VELD_IPTABLES_MODULES::moduleInsert(MODULE_OWNER, FIREWALL_MODULES)) {
-        FW_LOG_ERR("Failed to moduleInsert()");
-        return false;
-    }
-    return true;
-}
 
 /// A failure is only logged; the texts speak of loading, and those who watch the log know them so.
 void firewallModUnload() {
@@ -193,6 +158,21 @@ struct ProfileInForce {
 };
 
 }  // namespace
+
+bool firewallModLoad() {
+    if (VELD_IPTABLES_MODULES::isModuleLoad(MODULE_OWNER)) {
+        return true;
+    }
+    if (!VELD_IPTABLES_MODULES::iptablesCoreModLoad(MODULE_OWNER)) {
+        FW_LOG_ERR("Failed to iptablesCoreModLoad");
+        return false;
+    }
+    if (!VELD_IPTABLES_MODULES::moduleInsert(MODULE_OWNER, FIREWALL_MODULES)) {
+        FW_LOG_ERR("Failed to moduleInsert()");
+        return false;
+    }
+    return true;
+}
 
 // Settings
 
@@ -350,7 +330,6 @@ bool VELDFW::fwReset() {
 bool VELDFW::fwReload(bool keepEstablished) {
     const ExecLock lock;
     if (!lock.isTaken()) {
-        FW_LOG_ERR("TIMEOUT: getting lock");
         return false;
     }
     bool enabled = false;

@@ -16,8 +16,8 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
-#include <limits>
 
+#include "utils/descriptor.h"
 #include "utils/fileLock.h"
 #include "utils/jsonFile.h"
 #include "utils/log.h"
@@ -35,27 +35,6 @@ constexpr mode_t LOCK_DIRECTORY_MODE = 0770;
 constexpr mode_t LOCK_FILE_MODE = 0660;
 constexpr mode_t DATA_FILE_MODE = 0666;
 constexpr size_t LOCKED_PATH_SIZE = 1024;
-constexpr size_t READ_SIZE = 65536;
-
-/// A file descriptor that is closed at the end of its scope, unless closed before.
-class Descriptor {
-public:
-    explicit Descriptor(int opened) : fd(opened) {}
-    ~Descriptor() { close(); }
-    Descriptor(const Descriptor &) = delete;
-    Descriptor &operator=(const Descriptor &) = delete;
-
-    bool isOpen() const { return fd >= 0; }
-    int get() const { return fd; }
-    bool close() {
-        const int closing = fd;
-        fd = -1;
-        return closing < 0 || ::close(closing) == 0;
-    }
-
-private:
-    int fd;
-};
 
 /// In a directory where everybody may create files, a lock file that another user planted is taken away: it could be
 /// held locked for ever.
@@ -79,38 +58,6 @@ int regularFileOpen(const std::string &path) {
         return -1;
     }
     return fd;
-}
-
-bool readAll(int fd, std::string &text) {
-    struct stat status = {};
-    if (fstat(fd, &status) == 0 && status.st_size > 0) {
-        text.reserve(static_cast<size_t>(status.st_size));
-    }
-    std::array<char, READ_SIZE> chunk;
-    for (;;) {
-        const ssize_t length = read(fd, chunk.data(), chunk.size());
-        if (length == 0) {
-            return true;
-        }
-        if (length > 0) {
-            text.append(chunk.data(), static_cast<size_t>(length));
-        } else if (errno != EINTR) {
-            return false;
-        }
-    }
-}
-
-bool writeAll(int fd, const std::string &text) {
-    size_t written = 0;
-    while (written < text.size()) {
-        const ssize_t length = write(fd, text.data() + written, text.size() - written);
-        if (length >= 0) {
-            written += static_cast<size_t>(length);
-        } else if (errno != EINTR) {
-            return false;
-        }
-    }
-    return true;
 }
 
 bool jsonParse(const std::string &text, Json::Value &value) {

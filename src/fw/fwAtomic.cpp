@@ -1,0 +1,247 @@
+// SPDX-License-Identifier: Apache-2.0
+// Applying a command list as a whole: everything new, or everything as it was.
+#include <algorithm>
+#include <optional>
+
+#include "fw/commandList.h"
+#include "fw/commandOrigin.h"
+#include "fw/execLock.h"
+#include "fw/firewallModules.h"
+#include "fw/programRun.h"
+#include "fw/restoreInput.h"
+#include "utils/log.h"
+#include "veldfirewall/veldFW.h"
+
+namespace FW {
+
+namespace {
+
+constexpr const char *SCRATCH_NETWORK_PROGRAM = "/usr/bin/unshare";
+
+/// One family's half of an atomic apply.
+class FamilyApply {
+public:
+    FamilyApply(const char *familyName, const char *programName) : family(familyName), program(programName) {}
+
+    const std::string &familyName() const { return family; }
+
+    /// @return false, with the failure told, when a command cannot be part of a transaction
+    bool prepare(std::vector<ListedCommand> listed, FwApplyFailure &failure) {
+        commands = std::move(listed);
+        const std::optional<RestoreRefusal> refusal = restoreInputWrite(commands, input);
+        if (refusal) {
+            commandTell(refusal->command, refusal->reason, failure);
+        }
+        return !refusal;
+    }
+
+    /// Lets the program read everything and commit nothing.
+    bool tryOut(FwApplyFailure &failure) const { return restore({"--test"}, input.text, failure); }
+
+    bool snapshotTake(FwApplyFailure &failure) {
+        const ProgramRun run = programRun({program + "-save", "--counters", "--table", "filter"}, "");
+        if (!run.succeeded) {
+            failure.family = family;
+            failure.message = program + "-save: " + run.message;
+            return false;
+        }
+        snapshot = restoreInputOfSaved(run.output);
+        return true;
+    }
+
+    bool commit(FwApplyFailure &failure) const { return restore({}, input.text, failure); }
+
+    /// Puts back what commit() changed. A failure is only logged: there is nothing left to go back to.
+    void takeBack() const {
+        const std::string removal = restoreInputOfRemoval(input);
+        for (const std::string &text : {snapshot, removal}) {
+            if (text.empty()) {
+                continue;
+            }
+            const ProgramRun run = programRun({program + "-restore", "--noflush", "--counters"}, text);
+            if (!run.succeeded) {
+                FW_LOG_ERR("Failed to put the old rules of %s back: %s", program.c_str(), run.message.c_str());
+            }
+        }
+    }
+
+private:
+    std::string family;
+    std::string program;
+    std::vector<ListedCommand> commands;
+    RestoreInput input;
+    std::string snapshot;
+
+    bool restore(const std::vector<std::string> &options, const std::string &text, FwApplyFailure &failure) const {
+        std::vector<std::string> command = {program + "-restore", "--noflush"};
+        command.insert(command.end(), options.begin(), options.end());
+        const ProgramRun run = programRun(command, text);
+        if (run.succeeded) {
+            return true;
+        }
+        const size_t culprit = culpritFind(run.message);
+        if (culprit != RestoreInput::NO_COMMAND) {
+            commandTell(culprit, run.message, failure);
+        } else {
+            failure.family = family;
+            failure.message = program + "-restore: " + run.message;
+        }
+        return false;
+    }
+
+    /// The command that the program's message blames, or, where it blames only the end of the input, the first one that
+    /// a network namespace of its own refuses as well.
+    size_t culpritFind(const std::string &message) const {
+        const size_t line = restoreFailedLine(message);
+        if (line > 0 && line <= input.commandOfLine.size() &&
+            input.commandOfLine[line - 1] != RestoreInput::NO_COMMAND) {
+            return input.commandOfLine[line - 1];
+        }
+        const auto isRefused = [this](size_t lines) {
+            return !programRun({SCRATCH_NETWORK_PROGRAM, "--net", program + "-restore", "--noflush"},
+                               restoreInputOfTrial(input, lines))
+                        .succeeded;
+        };
+        size_t accepted = 0;
+        size_t refused = input.commandOfLine.size();
+        if (isRefused(accepted) || !isRefused(refused)) {
+            return RestoreInput::NO_COMMAND;
+        }
+        while (refused - accepted > 1) {
+            const size_t middle = accepted + (refused - accepted) / 2;
+            (isRefused(middle) ? refused : accepted) = middle;
+        }
+        return input.commandOfLine[refused - 1];
+    }
+
+    void commandTell(size_t index, const std::string &message, FwApplyFailure &failure) const {
+        failure.family = family;
+        failure.adapter = commands[index].group;
+        failure.command = commands[index].commandLine;
+        failure.message = message;
+    }
+};
+
+/// Both families, up to the commits of both or of none.
+bool allOrNothing(std::vector<FamilyApply> &families, FwApplyFailure &failure) {
+    const auto tryOut = [&](FamilyApply &family) { return family.tryOut(failure) && family.snapshotTake(failure); };
+    if (!std::all_of(families.begin(), families.end(), tryOut)) {
+        return false;
+    }
+    for (size_t i = 0; i < families.size(); ++i) {
+        if (families[i].commit(failure)) {
+            continue;
+        }
+        for (size_t committed = i; committed > 0; --committed) {
+            families[committed - 1].takeBack();
+        }
+        return false;
+    }
+    return true;
+}
+
+bool commandListApply(const Json::Value &commandList, FwApplyFailure &failure) {
+    const std::vector<ListedCommand> commands = commandsInOrder(commandList);
+    std::vector<FamilyApply> families;
+    for (const auto &[family, program] :
+         {std::pair(FAMILY_V4, IPTABLES_PROGRAM), std::pair(FAMILY_V6, IP6TABLES_PROGRAM)}) {
+        if (!commandList.isMember(family)) {
+            continue;
+        }
+        std::vector<ListedCommand> ofFamily;
+        std::copy_if(commands.begin(), commands.end(), std::back_inserter(ofFamily),
+                     [name = std::string(family)](const ListedCommand &command) { return command.family == name; });
+        if (!families.emplace_back(family, program).prepare(std::move(ofFamily), failure)) {
+            return false;
+        }
+    }
+    return allOrNothing(families, failure);
+}
+
+void failureLog(const FwApplyFailure &failure) {
+    std::string text = "Failed to apply the rules, the old ones stay in force";
+    text += failure.profile.empty() ? "" : ": profile " + failure.profile;
+    text += failure.adapter.empty() ? "" : ": adapter " + failure.adapter;
+    if (failure.rulePosition >= 0) {
+        text += ": rule " + std::to_string(failure.rulePosition) + " \"" + failure.ruleName + "\"";
+    }
+    text += failure.family.empty() ? "" : ": " + failure.family;
+    text += failure.command.empty() ? "" : ": \"" + failure.command + "\"";
+    FW_LOG_ERR("%s: %s", text.c_str(), failure.message.c_str());
+}
+
+/// Adds to the failure which rule of the profile the command comes from.
+void originTell(FwApplyFailure &failure) {
+    FWPROFILE profile;
+    CommandOrigin origin;
+    const size_t arguments = failure.command.find(' ') + 1;
+    if (!failure.command.empty() && VELDFW_PROFILE().profileGet(failure.profile, profile) &&
+        commandOriginFind(profile, failure.family, failure.command.substr(arguments), origin)) {
+        failure.adapter = origin.adapter;
+        failure.rulePosition = origin.rulePosition;
+        failure.ruleName = origin.ruleName;
+    }
+}
+
+}  // namespace
+
+bool VELDFW::fwExecAtomic(const Json::Value &commandList, FwApplyFailure &failure) {
+    FwApplyFailure found;
+    if (commandListApply(commandList, found)) {
+        return true;
+    }
+    failureLog(found);
+    failure = found;
+    return false;
+}
+
+bool VELDFW::fwExecAtomic(const Json::Value &commandList) {
+    FwApplyFailure failure;
+    return fwExecAtomic(commandList, failure);
+}
+
+bool VELDFW::fwReloadAtomic(bool keepEstablished, FwApplyFailure &failure) {
+    FwApplyFailure found;
+    const ExecLock lock;
+    if (!lock.isTaken()) {
+        failure.message = "another process holds the lock of the kernel's rules";
+        return false;
+    }
+    const auto fail = [&](const char *message) {
+        FW_LOG_ERR("%s", message);
+        found.message = message;
+        failure = found;
+        return false;
+    };
+    bool enabled = false;
+    if (!fwStatus(enabled)) {
+        return fail("Failed to check status");
+    }
+    if (!enabled) {
+        return true;
+    }
+    if (!firewallModLoad()) {
+        return fail("Failed to firewallModLoad()");
+    }
+    if (!fwProfileConfigGet(found.profile)) {
+        return fail("Failed to fwProfileConfigGet()");
+    }
+    Json::Value commands;
+    if (!fwIptablesRulesEnum(found.profile, commands, keepEstablished)) {
+        return fail("Failed to fwIptablesRulesEnum()");
+    }
+    if (!commandListApply(commands, found)) {
+        originTell(found);
+        failureLog(found);
+        failure = found;
+        return false;
+    }
+    return true;
+}
+
+bool VELDFW::fwReloadAtomic(bool keepEstablished) {
+    FwApplyFailure failure;
+    return fwReloadAtomic(keepEstablished, failure);
+}
+
+}  // namespace FW

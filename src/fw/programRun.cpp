@@ -1,0 +1,117 @@
+// SPDX-License-Identifier: Apache-2.0
+// Running a program with input, and keeping what it prints. The platform's VLIBCExecv() gives no input and prints to
+// the log; its pipes keep one direction only.
+#include "fw/programRun.h"
+
+#include <fcntl.h>
+#include <spawn.h>
+#include <sys/mman.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <chrono>
+#include <csignal>
+#include <cstring>
+#include <thread>
+
+#include "utils/descriptor.h"
+
+namespace FW {
+
+namespace {
+
+constexpr int STATUS_TABLES_IN_USE = 4;
+constexpr std::chrono::seconds TABLES_IN_USE_TIME(10);
+constexpr std::chrono::milliseconds RETRY_PAUSE(50);
+
+/// A file in memory: unlike a pipe it never blocks the program, and a process that the program leaves behind cannot
+/// keep us waiting for its end.
+Descriptor memoryFile(const char *name) {
+    return Descriptor(memfd_create(name, MFD_CLOEXEC));
+}
+
+std::string contentOf(const Descriptor &file) {
+    std::string text;
+    lseek(file.get(), 0, SEEK_SET);
+    readAll(file.get(), text);
+    return text;
+}
+
+int spawn(const std::vector<std::string> &command, int in, int out, int err, pid_t &process) {
+    std::vector<char *> arguments;
+    for (const std::string &argument : command) {
+        arguments.push_back(const_cast<char *>(argument.c_str()));
+    }
+    arguments.push_back(nullptr);
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_adddup2(&actions, in, STDIN_FILENO);
+    posix_spawn_file_actions_adddup2(&actions, out, STDOUT_FILENO);
+    posix_spawn_file_actions_adddup2(&actions, err, STDERR_FILENO);
+    posix_spawn_file_actions_addclosefrom_np(&actions, STDERR_FILENO + 1);
+    posix_spawnattr_t attributes;
+    posix_spawnattr_init(&attributes);
+    sigset_t signals;
+    sigfillset(&signals);
+    posix_spawnattr_setsigdefault(&attributes, &signals);
+    sigemptyset(&signals);
+    posix_spawnattr_setsigmask(&attributes, &signals);
+    posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETSIGMASK);
+    const int error = posix_spawn(&process, arguments[0], &actions, &attributes, arguments.data(), environ);
+    posix_spawnattr_destroy(&attributes);
+    posix_spawn_file_actions_destroy(&actions);
+    return error;
+}
+
+/// @return the exit status; negative, with the reason in `run.message`, when there is none
+int runOnce(const std::vector<std::string> &command, const std::string &input, ProgramRun &run) {
+    const Descriptor in = memoryFile("input");
+    const Descriptor out = memoryFile("output");
+    const Descriptor err = memoryFile("errors");
+    if (!in.isOpen() || !out.isOpen() || !err.isOpen() || !writeAll(in.get(), input) ||
+        lseek(in.get(), 0, SEEK_SET) != 0) {
+        run.message = std::string("no memory for its input and output: ") + std::strerror(errno);
+        return -1;
+    }
+    pid_t process = -1;
+    if (const int error = spawn(command, in.get(), out.get(), err.get(), process); error != 0) {
+        run.message = std::string("cannot be started: ") + std::strerror(error);
+        return -1;
+    }
+    int status = 0;
+    while (waitpid(process, &status, 0) < 0) {
+        if (errno != EINTR) {
+            run.message = std::string("its exit status is lost: ") + std::strerror(errno);
+            return -1;
+        }
+    }
+    run.output = contentOf(out);
+    run.message = contentOf(err);
+    run.message.erase(run.message.find_last_not_of(" \n") + 1);
+    if (WIFSIGNALED(status)) {
+        run.message += " (killed by signal " + std::to_string(WTERMSIG(status)) + ")";
+        return -1;
+    }
+    if (run.message.empty() && WEXITSTATUS(status) != 0) {
+        run.message = "exited with status " + std::to_string(WEXITSTATUS(status));
+    }
+    return WEXITSTATUS(status);
+}
+
+}  // namespace
+
+ProgramRun programRun(const std::vector<std::string> &command, const std::string &input) {
+    const auto deadline = std::chrono::steady_clock::now() + TABLES_IN_USE_TIME;
+    for (;;) {
+        ProgramRun run;
+        const int status = runOnce(command, input, run);
+        if (status != STATUS_TABLES_IN_USE || std::chrono::steady_clock::now() >= deadline) {
+            run.succeeded = status == 0;
+            return run;
+        }
+        std::this_thread::sleep_for(RETRY_PAUSE);
+    }
+}
+
+}  // namespace FW
