@@ -7,7 +7,7 @@ cd "$(dirname "${BASH_SOURCE[0]}")/.."
 
 # As in the work tree, so that a new file counts before it is committed; a deleted one does not.
 tracked() {
-  git ls-files --cached --others --exclude-standard -z -- "$@" |
+  git -c safe.directory="$PWD" ls-files --cached --others --exclude-standard -z -- "$@" |
     while IFS= read -r -d '' file; do [[ ! -f $file ]] || printf '%s\0' "$file"; done
 }
 mapfile -d '' sources < <(tracked '*.c' '*.cpp' '*.h')
@@ -30,7 +30,7 @@ for file in "${sources[@]}" "${scripts[@]}"; do
 done
 
 # A path of the checkout in a tracked file works on one machine only.
-if grep -nIF -- "$PWD/" "${all[@]}"; then
+if grep -nIP -- "(?<![\\w./-])\\Q$PWD\\E/" "${all[@]}"; then
   echo "the lines above hold this checkout's path"
   faults=1
 fi
