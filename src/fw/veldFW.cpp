@@ -112,14 +112,26 @@ bool switchWithPostHook(const std::function<bool()> &switchOver, const std::func
     return outcome;
 }
 
+/// Runs what reads stored documents. One that cannot be converted, or a lock file that cannot be opened, is a failure
+/// of the operation and no business of its caller.
+bool readOrLog(const std::function<bool()> &read) {
+    try {
+        return read();
+    } catch (const std::exception &error) {
+        FW_LOG_ERR("The stored configuration cannot be read: %s", error.what());
+        return false;
+    }
+}
+
 /// What block queries ask: the switch and the profile in force, read once for all ports of a service.
 struct ProfileInForce {
     bool enabled = false;
     FWPROFILE profile;
 
     bool read() {
-        VELDFW firewall;
-        if (!firewall.fwStatus(enabled)) {
+        Json::Value settings;
+        const auto statusRead = [&] { return settingsGetOrLog(settings) && settingsStatus(settings, enabled); };
+        if (!readOrLog(statusRead)) {
             FW_LOG_ERR("Failed to check firewall status");
             return false;
         }
@@ -127,11 +139,11 @@ struct ProfileInForce {
             return true;
         }
         std::string name;
-        if (!firewall.fwProfileConfigGet(name)) {
+        if (!settingsActiveProfileOrLog(settings, name)) {
             FW_LOG_ERR("Failed to fwProfileConfigGet()");
             return false;
         }
-        if (!VELDFW_PROFILE().profileGet(name, profile)) {
+        if (!readOrLog([&] { return VELDFW_PROFILE().profileGet(name, profile); })) {
             FW_LOG_ERR("Failed to profileGet(%s)", name.c_str());
             return false;
         }
@@ -190,24 +202,12 @@ bool VELDFW::configSet(const Json::Value &changes) {
 
 bool VELDFW::fwStatus(bool &enabled) {
     Json::Value settings;
-    if (!configGet(settings)) {
-        FW_LOG_ERR("Falied to configGet()");
-        return false;
-    }
-    return settingsStatus(settings, enabled);
+    return settingsGetOrLog(settings) && settingsStatus(settings, enabled);
 }
 
 bool VELDFW::fwProfileConfigGet(std::string &name) {
     Json::Value settings;
-    if (!configGet(settings)) {
-        FW_LOG_ERR("Falied to configGet()");
-        return false;
-    }
-    if (!settings.isMember("profile")) {
-        FW_LOG_ERR("There are no key: %s in config", "profile");
-        return false;
-    }
-    return settingsActiveProfile(settings, name);
+    return settingsGetOrLog(settings) && settingsActiveProfileOrLog(settings, name);
 }
 
 bool VELDFW::fwProfileConfigSet(const std::string &name, bool reload) {
@@ -221,8 +221,7 @@ bool VELDFW::fwProfileConfigSet(const std::string &name, bool reload) {
         return false;
     }
     Json::Value settings;
-    if (!configGet(settings)) {
-        FW_LOG_ERR("Falied to configGet()");
+    if (!settingsGetOrLog(settings)) {
         return false;
     }
     settings["profile"] = name;
@@ -589,7 +588,7 @@ bool VELDFW_PROFILE::RemoveTestProfile(std::string name) {
 bool VELDFW_PROFILE::profileAddServToReserve(const std::string &adapter, const std::string &servName, FW_POLICY policy,
                                              bool reload) {
     std::map<std::string, StoredProfile> profiles;
-    if (!storedProfilesLoad(profiles)) {
+    if (!readOrLog([&] { return storedProfilesLoad(profiles); })) {
         FW_LOG_ERR("Failed to profileEnum()");
         return false;
     }
@@ -609,7 +608,7 @@ bool VELDFW_PROFILE::profileAddServToReserve(const std::string &adapter, const s
 
 bool VELDFW_PROFILE::profileRemoveServ(const std::string &servName) {
     std::map<std::string, StoredProfile> profiles;
-    if (!storedProfilesLoad(profiles)) {
+    if (!readOrLog([&] { return storedProfilesLoad(profiles); })) {
         FW_LOG_ERR("Failed to profileEnum()");
         return false;
     }
@@ -625,12 +624,12 @@ bool VELDFW_PROFILE::profileRemoveServ(const std::string &servName) {
 
 bool VELDFW_PROFILE::profileChangeAdapter(const std::string &oldAdapter, const std::string &newAdapter, bool reload) {
     std::map<std::string, StoredProfile> profiles;
-    if (!storedProfilesLoad(profiles)) {
+    if (!readOrLog([&] { return storedProfilesLoad(profiles); })) {
         FW_LOG_ERR("Failed to profileEnum()");
         return false;
     }
     std::string activeProfile;
-    if (!VELDFW().fwProfileConfigGet(activeProfile)) {
+    if (!readOrLog([&] { return VELDFW().fwProfileConfigGet(activeProfile); })) {
         FW_LOG_ERR("Failed to fwProfileConfigGet()");
         return false;
     }

@@ -41,6 +41,14 @@ bool settingsGet(Json::Value &settings) {
     return true;
 }
 
+bool settingsGetOrLog(Json::Value &settings) {
+    if (!settingsGet(settings)) {
+        SETTINGS_LOG_ERR("Falied to configGet()");
+        return false;
+    }
+    return true;
+}
+
 bool settingsSet(const Json::Value &changes) {
     Json::Value settings;
     if (!settingsGet(settings)) {
@@ -71,6 +79,14 @@ bool settingsActiveProfile(const Json::Value &settings, std::string &name) {
     }
     name = profile.asString();
     return true;
+}
+
+bool settingsActiveProfileOrLog(const Json::Value &settings, std::string &name) {
+    if (!settings.isMember(PROFILE_KEY)) {
+        SETTINGS_LOG_ERR("There are no key: %s in config", PROFILE_KEY);
+        return false;
+    }
+    return settingsActiveProfile(settings, name);
 }
 
 }  // namespace FW

@@ -15,12 +15,16 @@ void settingsInit(Json::Value &settings);
 /// Reads the settings; a missing file is created with the defaults. @return false when the file cannot be read or is
 /// no object; the reason is logged
 bool settingsGet(Json::Value &settings);
+/// As settingsGet(), with a failure also logged as such.
+bool settingsGetOrLog(Json::Value &settings);
 /// Merges the members of `changes` into the stored settings. @return false, logged, when reading or writing failed
 bool settingsSet(const Json::Value &changes);
 /// The switch; a missing member means off. @return false, logged, when the member is no boolean
 bool settingsStatus(const Json::Value &settings, bool &enabled);
 /// The active profile; a missing member gives an empty name. @return false, logged, when the member is no text
 bool settingsActiveProfile(const Json::Value &settings, std::string &name);
+/// The active profile; a missing member is a failure as well. @return false, logged
+bool settingsActiveProfileOrLog(const Json::Value &settings, std::string &name);
 
 }  // namespace FW
 
