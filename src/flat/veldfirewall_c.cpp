@@ -8,6 +8,8 @@
 #include <boost/algorithm/string/split.hpp>
 
 #include <algorithm>
+#include <exception>
+#include <functional>
 #include <map>
 #include <string>
 #include <vector>
@@ -23,33 +25,43 @@ constexpr int ALLOWED = 1;
 constexpr int NOT_ALLOWED = 0;
 constexpr int RELOAD = 1;
 
-int status(bool succeeded) {
-    return succeeded ? 0 : -1;
+/// A C program cannot catch what the libraries below throw, such as for a stored document of wrong types.
+bool runOrLog(const std::function<bool()> &operation) {
+    try {
+        return operation();
+    } catch (const std::exception &error) {
+        FW_LOG_ERR("Ended by an exception: %s", error.what());
+        return false;
+    }
+}
+
+int statusOf(const std::function<bool()> &operation) {
+    return runOrLog(operation) ? 0 : -1;
 }
 
 }  // namespace
 
 int VELDFwRuleHup(void) {
-    FW::VELDFW firewall;
-    return status(firewall.fwUpdate() && firewall.fwReload(true));
+    return statusOf([] { return FW::VELDFW().fwUpdate() && FW::VELDFW().fwReload(true); });
 }
 
 void VELDFwReset(void) {
-    FW::VELDFW().fwReset();
+    runOrLog([] { return FW::VELDFW().fwReset(); });
 }
 
 int VLIBFwServRemoveRec(const char *servName) {
     if (servName == nullptr) {
         return -1;
     }
-    return status(FW::VELDFW_PROFILE().profileRemoveServ(servName));
+    return statusOf([&] { return FW::VELDFW_PROFILE().profileRemoveServ(servName); });
 }
 
 int VLIBFwChangeAdatper(const char *oldAdapter, const char *newAdapter, int reload) {
     if (newAdapter == nullptr) {
         return -1;
     }
-    return status(FW::VELDFW_PROFILE().profileChangeAdapter(oldAdapter, newAdapter, reload == RELOAD));
+    return statusOf(
+        [&] { return FW::VELDFW_PROFILE().profileChangeAdapter(oldAdapter, newAdapter, reload == RELOAD); });
 }
 
 int VELDFwPortsCheckAllowByAdapter(const char *adapter, const char *servName) {
@@ -59,7 +71,8 @@ int VELDFwPortsCheckAllowByAdapter(const char *adapter, const char *servName) {
         return -1;
     }
     std::map<std::string, FW::FW_POLICY> verdicts;
-    if (!FW::VELDFW().fwServIsBlocked(servName, adapter == nullptr ? "" : adapter, verdicts)) {
+    if (!runOrLog(
+            [&] { return FW::VELDFW().fwServIsBlocked(servName, adapter == nullptr ? "" : adapter, verdicts); })) {
         FW_LOG_ERR("Failed to check %s is block or not", servName);
         return -1;
     }
@@ -79,12 +92,14 @@ int VLIBFwRuleReserveServInsert(const char *servList, int allow, int reload) {
     boost::algorithm::split(services, std::string(servList), boost::algorithm::is_any_of(","),
                             boost::algorithm::token_compress_on);
     for (const std::string &service : services) {
-        if (!FW::VELDFW_PROFILE().profileAddServToReserve(FW::FW_ADAPTER_GLOBAL, service, policy, false)) {
+        if (!runOrLog([&] {
+                return FW::VELDFW_PROFILE().profileAddServToReserve(FW::FW_ADAPTER_GLOBAL, service, policy, false);
+            })) {
             FW_LOG_ERR("Failed to assign serv [%s]", service.c_str());
             return -1;
         }
     }
-    if (reload == RELOAD && !FW::VELDFW().fwReload(true)) {
+    if (reload == RELOAD && !runOrLog([] { return FW::VELDFW().fwReload(true); })) {
         FW_LOG_ERR("Failed to reload firewall");
         return -1;
     }
