@@ -70,7 +70,7 @@ Json::Value ruleEncode(const FWRULE &rule, unsigned position) {
 
 void rulesDecode(const Json::Value &json, std::map<std::string, std::vector<FWRULE>> &rules) {
     for (auto adapter = json.begin(); adapter != json.end(); ++adapter) {
-        if (adapter->empty()) {
+        if (adapter->size() == 0) {  // a scalar as well
             continue;
         }
         std::vector<FWRULE> &list = rules[adapter.name()];
