@@ -34,7 +34,7 @@ bool settingsGet(Json::Value &settings) {
     if (!jsonFileLoad(settings, SETTINGS_PATH)) {
         return false;
     }
-    if (!settings.isObject()) {
+    if (!settings.isObject() && !settings.isNull()) {
         SETTINGS_LOG_ERR("%s holds no object", SETTINGS_PATH);
         return false;
     }

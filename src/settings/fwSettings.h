@@ -13,7 +13,7 @@ namespace FW {
 /// Sets "status" and "profile" to their defaults.
 void settingsInit(Json::Value &settings);
 /// Reads the settings; a missing file is created with the defaults. @return false when the file cannot be read or is
-/// no object; the reason is logged
+/// neither object nor null; the reason is logged
 bool settingsGet(Json::Value &settings);
 /// As settingsGet(), with a failure also logged as such.
 bool settingsGetOrLog(Json::Value &settings);
