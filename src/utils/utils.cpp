@@ -14,6 +14,7 @@
 
 #include <array>
 #include <cerrno>
+#include <climits>
 #include <cstdio>
 #include <cstring>
 
@@ -35,6 +36,7 @@ constexpr mode_t LOCK_DIRECTORY_MODE = 0770;
 constexpr mode_t LOCK_FILE_MODE = 0660;
 constexpr mode_t DATA_FILE_MODE = 0666;
 constexpr size_t LOCKED_PATH_SIZE = 1024;
+constexpr const char *LOCK_EXTENSION = ".lock";
 
 /// In a directory where everybody may create files, a lock file that another user planted is taken away: it could be
 /// held locked for ever.
@@ -47,6 +49,17 @@ void plantedFileRemove(const std::string &path) {
     if (!trusted) {
         unlink(path.c_str());
     }
+}
+
+/// Whether the directory's limit leaves room for the name of the lock file. Anybody's file that happens to lie among
+/// the profiles can fail this; such a file counts as unreadable.
+bool isLockable(const std::string &path) {
+    const size_t nameLength = path.size() - (path.rfind('/') + 1);
+    if (nameLength + std::strlen(LOCK_EXTENSION) > NAME_MAX) {
+        FW_LOG_ERR("Failed to open json file %s: the name is too long for its lock file", path.c_str());
+        return false;
+    }
+    return true;
 }
 
 /// Opens an existing regular file for reading. Devices, pipes and directories are refused, without waiting for them.
@@ -123,7 +136,7 @@ std::string getLockFile(const std::string &path) {
     }
     std::array<char, LOCKED_PATH_SIZE> buffer = {};
     std::snprintf(buffer.data(), buffer.size(), "%s", path.c_str());
-    const std::string lockPath = std::string(directory) + basename(buffer.data()) + ".lock";
+    const std::string lockPath = std::string(directory) + basename(buffer.data()) + LOCK_EXTENSION;
     if (directory == FALLBACK_LOCK_DIRECTORY) {
         plantedFileRemove(lockPath);
     }
@@ -136,6 +149,9 @@ std::string getLockFile(const std::string &path) {
 bool jsonFileLoad(Json::Value &value, const std::string &path) {
     if (access(path.c_str(), F_OK) != 0) {
         FW_LOG_ERR("File %s does not exist", path.c_str());
+        return false;
+    }
+    if (!isLockable(path)) {
         return false;
     }
     std::string text;
@@ -163,6 +179,9 @@ bool jsonFileLoad(Json::Value &value, const std::string &path) {
 }
 
 bool jsonFileDump(const Json::Value &value, const std::string &path) {
+    if (!isLockable(path)) {
+        return false;
+    }
     FileLock lock(getLockFile(path));
     if (!lock.lockUntil(fileLockDeadline())) {
         FW_LOG_ERR("Failed to get lock timeout");
