@@ -60,7 +60,9 @@ bool profilePathsEnum(std::vector<std::string> &paths) {
 
 /// The one scan that every operation makes: visits each profile file, last first, so that of two files with one name
 /// the visitor sees the one that counts last.
-bool profileScan(const std::function<void(const std::string &name, ProfileFile &&file)> &visit) {
+/// @param unreadable receives, when given, the paths of the files that could not be loaded
+bool profileScan(const std::function<void(const std::string &name, ProfileFile &&file)> &visit,
+                 std::vector<std::string> *unreadable = nullptr) {
     std::vector<std::string> paths;
     if (!profilePathsEnum(paths)) {
         return false;
@@ -69,6 +71,9 @@ bool profileScan(const std::function<void(const std::string &name, ProfileFile &
         ProfileFile file;
         if (!jsonFileLoad(file.document, *path)) {
             FW_LOG_ERR("Failed to load json from %s", path->c_str());
+            if (unreadable != nullptr) {
+                unreadable->push_back(*path);
+            }
             continue;
         }
         if (!file.document.isObject() || !file.document["name"].isString()) {
@@ -81,8 +86,9 @@ bool profileScan(const std::function<void(const std::string &name, ProfileFile &
 }
 
 /// As profileScan(), with the failure logged for the callers that need the names.
-bool profileScanOrLog(const std::function<void(const std::string &name, ProfileFile &&file)> &visit) {
-    if (!profileScan(visit)) {
+bool profileScanOrLog(const std::function<void(const std::string &name, ProfileFile &&file)> &visit,
+                      std::vector<std::string> *unreadable = nullptr) {
+    if (!profileScan(visit, unreadable)) {
         FW_LOG_ERR("Failed to create meta json from %s", PROFILE_DIRECTORY);
         return false;
     }
@@ -326,8 +332,10 @@ bool VELDFW_JSON_DB::profileDelete(const std::string &name) {
 
 bool VELDFW_JSON_DB::exportConfig(Json::Value &out) {
     Json::Value &documents = out["config_profiles"];
-    Json::Value meta(Json::objectValue);
-    if (!metaCreateOrLog(*this, meta)) {
+    std::map<std::string, ProfileFile> files;
+    std::vector<std::string> unreadable;
+    if (!profileScanOrLog([&](const std::string &name, ProfileFile &&file) { files[name] = std::move(file); },
+                          &unreadable)) {
         return false;
     }
     Json::Value settings;
@@ -338,20 +346,17 @@ bool VELDFW_JSON_DB::exportConfig(Json::Value &out) {
     }
     out["config_firewall_settings"] = settings;
     out["config_version"] = CONFIG_VERSION;
-    for (auto entry = meta.begin(); entry != meta.end(); ++entry) {
-        const std::string file = (*entry)["fileName"].asString() + PROFILE_EXTENSION;
-        const std::string path = PROFILE_DIRECTORY + file;
-        Json::Value document;
-        if (jsonFileLoad(document, path)) {
-            documents[file] = document;
-            continue;
+    for (auto &[name, file] : files) {
+        documents[file.fileName + PROFILE_EXTENSION] = std::move(file.document);
+    }
+    // A file that cannot be read does not tell its name. When the profile in force was not found, it may be this one,
+    // and a backup without it would pass for whole.
+    if (files.count(activeProfile) == 0 && !unreadable.empty()) {
+        for (const std::string &path : unreadable) {
+            FW_LOG_ERR("Failed to load json from [%s] for profile [%s]%s", path.c_str(), activeProfile.c_str(),
+                       " which is the current one.");
         }
-        const bool isActive = entry.name() == activeProfile;
-        FW_LOG_ERR("Failed to load json from [%s] for profile [%s]%s", path.c_str(), entry.name().c_str(),
-                   isActive ? " which is the current one." : "");
-        if (isActive) {
-            return false;
-        }
+        return false;
     }
     return true;
 }
