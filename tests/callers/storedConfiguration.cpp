@@ -38,10 +38,13 @@ FW::FWPROFILE storedProfile(const std::string &name) {
     return profile;
 }
 
-void defineService(const std::string &name, const std::string &protocol, const std::string &ports) {
+void defineService(const std::string &name, const std::string &protocol, const std::string &ports, Side side) {
+    const std::string filled = R"({"protocol": ")" + protocol + R"(", "ports": [)" + ports + "]}";
+    const std::string empty = R"({"protocol": "tcp", "ports": []})";
+    const bool isSource = side == Side::source;
     writeFile("/usr/veld/etc/services.d/" + name + ".json",
-              R"({"name": ")" + name + R"(", "enabled": true, "source": {"protocol": "tcp", "ports": []}, )" +
-                  R"("destination": {"protocol": ")" + protocol + R"(", "ports": [)" + ports + "]}}");
+              R"({"name": ")" + name + R"(", "enabled": true, "source": )" + (isSource ? filled : empty) +
+                  R"(, "destination": )" + (isSource ? empty : filled) + "}");
 }
 
 void installPlatformData() {

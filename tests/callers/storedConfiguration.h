@@ -24,8 +24,10 @@ bool storedStatus();
 void storeProfile(const std::string &file, const FW::FWPROFILE &profile);
 /// The profile as stored; fails the test when it cannot be read.
 FW::FWPROFILE storedProfile(const std::string &name);
-/// Writes a service definition with destination ports (a JSON array's text: "\"22\", \"80-90\"").
-void defineService(const std::string &name, const std::string &protocol, const std::string &ports);
+enum class Side { source, destination };
+/// Writes a service definition with ports of one side (a JSON array's text: "\"22\", \"80-90\"").
+void defineService(const std::string &name, const std::string &protocol, const std::string &ports,
+                   Side side = Side::destination);
 /// Installs a list of modules that no kernel knows, so that loads succeed and change nothing, and a network tool that
 /// knows no tunnels.
 void installPlatformData();
