@@ -51,6 +51,18 @@ int applicationRun(int argc, char **argv) {
         app.parse(argc, argv);
     } catch (const CLI::Success &success) {  // --help, --version
         return app.exit(success);
+    } catch (const CLI::RequiredError &error) {
+        // CLI11 misses the verb before it looks at the words that are none.
+        const std::string verb = verbNamed(app);
+        const std::string text = error.what();
+        for (int i = 1; i < argc && text.find("subcommand") != std::string::npos; ++i) {
+            const std::string word = argv[i];
+            if (word[0] != '-' && verb.find(" " + word) == std::string::npos) {
+                return report("\"" + word + "\" is no verb of \"" + verb + "\"; see \"" + verb + " --help\"",
+                              STATUS_USAGE);
+            }
+        }
+        return report(text + "; see \"" + verb + " --help\"", STATUS_USAGE);
     } catch (const CLI::ParseError &error) {
         return report(std::string(error.what()) + "; see \"" + verbNamed(app) + " --help\"", STATUS_USAGE);
     }

@@ -3,13 +3,16 @@
 #include "frame/libraryCall.h"
 
 #include <fcntl.h>
+#include <poll.h>
 #include <sys/mman.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
 #include <csignal>
 #include <cstring>
 #include <iostream>
@@ -24,6 +27,7 @@ namespace veldfwctl {
 namespace {
 
 constexpr const char *IDENT = "veldfwctl";
+constexpr std::chrono::milliseconds WATCH_INTERVAL{50};
 
 /// A file in memory, closed in the end.
 class MemoryFile {
@@ -132,11 +136,15 @@ CallResult protectedCall(const std::function<bool()> &operation, const std::func
         }
         _exit(succeeded ? STATUS_DONE : STATUS_FAILED);
     }
+    const auto handle = static_cast<int>(syscall(SYS_pidfd_open, process, 0));
     int status = 0;
     pid_t ended = 0;
     while ((ended = waitpid(process, &status, WNOHANG)) == 0) {
+        pollfd wait = {handle, POLLIN, 0};
+        poll(&wait, 1, static_cast<int>(WATCH_INTERVAL.count()));
         watch(process);
     }
+    close(handle);
     CallResult result;
     result.messages = logMessagesParse(file.text());
     result.succeeded = ended == process && WIFEXITED(status) && WEXITSTATUS(status) == STATUS_DONE;

@@ -30,7 +30,7 @@ void require(const std::string &what, const std::string &remedy, const std::func
 
 /// Runs an operation in a process of its own, cut off from the terminal: neither a hang-up nor an interrupt nor the
 /// death of the tool stops it half-way, which could leave the machine closed to everybody. Returns when it has ended.
-/// @param watch called again and again meanwhile with the id of the process; returns after at most about 0.1 s
+/// @param watch called some 20 times a second meanwhile, with the id of the process
 CallResult protectedCall(const std::function<bool()> &operation, const std::function<void(int process)> &watch);
 
 /// "a; b; c" without repetitions; empty for no messages.

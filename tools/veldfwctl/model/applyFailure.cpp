@@ -1,0 +1,27 @@
+// SPDX-License-Identifier: Apache-2.0
+// Finds in the library's messages which command failed and what it said.
+#include "model/applyFailure.h"
+
+namespace veldfwctl {
+
+FailedCommand failedCommandFind(const std::vector<std::string> &messages) {
+    static const std::string start = "Failed to execute \"";
+    FailedCommand failed;
+    for (const std::string &message : messages) {
+        if (message.compare(0, start.size(), start) == 0 && message.back() == '"') {
+            failed.command = message.substr(start.size(), message.size() - start.size() - 1);
+            break;
+        }
+    }
+    const std::string program = failed.command.substr(0, failed.command.find(' '));
+    for (const std::string &message : messages) {
+        if (!failed.command.empty() && message.compare(0, failed.command.size() + 2, failed.command + ": ") == 0) {
+            failed.said += (failed.said.empty() ? "" : ", ") + message.substr(failed.command.size() + 2);
+        } else if (message != start + failed.command + "\"" && message != "Failed to execute " + program) {
+            failed.rest.push_back(message);
+        }
+    }
+    return failed;
+}
+
+}  // namespace veldfwctl

@@ -1,0 +1,24 @@
+// SPDX-License-Identifier: Apache-2.0
+// The firewall's chains as they are in the kernel.
+#ifndef VELDFWCTL_KERNELSTATE_H
+#define VELDFWCTL_KERNELSTATE_H
+
+#include <map>
+#include <string>
+
+#include "model/kernelChains.h"
+
+namespace veldfwctl {
+
+struct KernelState {
+    std::map<std::string, ChainState> v4;
+    std::map<std::string, ChainState> v6;
+    std::string error;  ///< why nothing is known; empty when all was read
+};
+
+/// Asks iptables and ip6tables, both at once.
+KernelState kernelStateRead();
+
+}  // namespace veldfwctl
+
+#endif
