@@ -16,7 +16,7 @@ namespace veld {
 namespace {
 
 // Enough for any diagnosis; a program that writes more is not quoted in full.
-constexpr std::size_t kKeptErrorOutput = 64 * 1024;
+constexpr std::size_t kKeptErrorOutput = std::size_t{64} * 1024;
 
 class FileActions {
 public:

@@ -95,7 +95,7 @@ std::string uniqueNameBeside(const std::string &path) {
     while (getrandom(&number, sizeof number, 0) < 0 && errno == EINTR) {
     }
     char digits[18];
-    snprintf(digits, sizeof digits, ".%016llx", static_cast<unsigned long long>(number));
+    (void)snprintf(digits, sizeof digits, ".%016llx", static_cast<unsigned long long>(number));
     return path + digits;
 }
 

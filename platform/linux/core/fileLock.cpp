@@ -89,9 +89,7 @@ OpenedFile openLockFile(const std::string &path, bool exclusive, Deadline deadli
     // lock for ever.
     file = OpenedFile();
     file.fd = UniqueFd(open(path.c_str(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC | O_NOFOLLOW, 0600));
-    if (!file.fd)
-        file.error = errno;
-    else if (fstat(file.fd.get(), &file.info) != 0)
+    if (!file.fd || fstat(file.fd.get(), &file.info) != 0)
         file.error = errno;
     return file;
 }

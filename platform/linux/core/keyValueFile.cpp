@@ -13,7 +13,7 @@ namespace veld {
 namespace {
 
 // No configuration file is near this size; it bounds what a broken one can do.
-constexpr std::size_t kLargestFile = 16 * 1024 * 1024;
+constexpr std::size_t kLargestFile = std::size_t{16} * 1024 * 1024;
 
 int fail(int error) {
     VELD_SET_ERROR(systemErrorCode(error));

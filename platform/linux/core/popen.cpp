@@ -91,7 +91,7 @@ int closePipe(FILE *stream) {
         errno = EBADF;
         return -1;
     }
-    fclose(stream);
+    (void)fclose(stream);
     int status = 0;
     const int error = waitForProcess(program.process, status);
     program.errorOutput.finish();

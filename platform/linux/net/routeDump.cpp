@@ -17,7 +17,7 @@ namespace veld {
 namespace {
 
 // The kernel fills messages up to this size when the reader offers it.
-constexpr std::size_t kReceiveBuffer = 32 * 1024;
+constexpr std::size_t kReceiveBuffer = std::size_t{32} * 1024;
 
 // The attributes of interest by type; later ones of a type win, as in the kernel.
 template <std::size_t Types> struct Attributes {
@@ -42,7 +42,7 @@ std::optional<in_addr> addressIn(const nlattr *attribute) {
 // Texts in messages end with NUL or with their attribute.
 std::string textIn(const nlattr *attribute) {
     const auto *const text = static_cast<const char *>(mnl_attr_get_payload(attribute));
-    return std::string(text, strnlen(text, mnl_attr_get_payload_len(attribute)));
+    return {text, strnlen(text, mnl_attr_get_payload_len(attribute))};
 }
 
 std::optional<in_addr> sitLocalIn(const nlattr *linkInfo) {

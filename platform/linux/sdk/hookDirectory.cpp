@@ -102,7 +102,8 @@ int listExecutables(const std::string &directory, std::vector<std::string> &path
         return errno == ENOENT ? 0 : errno;
     errno = 0;
     while (const dirent *entry = readdir(stream.get())) {
-        const std::string path = directory + "/" + entry->d_name;
+        std::string path = directory;
+        path.append("/").append(entry->d_name);
         struct stat info {};
         if (entry->d_name[0] != '.' && stat(path.c_str(), &info) == 0 && S_ISREG(info.st_mode) &&
             access(path.c_str(), X_OK) == 0)
@@ -123,6 +124,7 @@ bool runHookDirectory(const std::string &directory, const char *argument,
     }
     std::vector<std::string> variables = environmentWith(environ, arguments);
     std::vector<char *> environment;
+    environment.reserve(variables.size() + 1);
     for (std::string &variable : variables)
         environment.push_back(variable.data());
     environment.push_back(nullptr);

@@ -13,7 +13,7 @@
 namespace veld {
 namespace {
 
-constexpr std::size_t kLargestDefinition = 1024 * 1024;
+constexpr std::size_t kLargestDefinition = std::size_t{1024} * 1024;
 
 std::vector<std::string> listDefinitions(const std::string &directory) {
     std::vector<std::string> names;
@@ -48,7 +48,8 @@ bool readDefinition(const std::string &path, ServiceDefinition &definition, std:
 ServicesByName readDefinitionDirectory(const std::string &directory) {
     ServicesByName services;
     for (const std::string &name : listDefinitions(directory)) {
-        const std::string path = directory + "/" + name;
+        std::string path = directory;
+        path.append("/").append(name);
         ServiceDefinition definition;
         std::string reason;
         if (!readDefinition(path, definition, reason)) {

@@ -82,19 +82,19 @@ bool readDefinition(const Json::Value &root, ServiceDefinition &definition, std:
         return false;
     }
     if (!root["name"].isString() || !isServiceName(root["name"].asString())) {
-        reason = "\"name\" is no string of 1 to 255 characters without blanks";
+        reason = R"("name" is no string of 1 to 255 characters without blanks)";
         return false;
     }
     definition.name = root["name"].asString();
     if (root.isMember("enabled") && !root["enabled"].isBool()) {
-        reason = "\"enabled\" is neither true nor false";
+        reason = R"("enabled" is neither true nor false)";
         return false;
     }
     definition.enabled = root.get("enabled", true).asBool();
     const bool hasSource = root.isMember("source");
     const bool hasDestination = root.isMember("destination");
     if (!hasSource && !hasDestination) {
-        reason = "it has neither \"source\" nor \"destination\"";
+        reason = R"(it has neither "source" nor "destination")";
         return false;
     }
     if ((hasSource && !parsePorts(root["source"], "source", definition.source, reason)) ||

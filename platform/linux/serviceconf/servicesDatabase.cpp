@@ -42,7 +42,7 @@ std::vector<DatabaseEntry> readServicesDatabase() {
         servent storage{};
         servent *entry = nullptr;
         const int error = getservent_r(&storage, buffer.data(), buffer.size(), &entry);
-        if (error == ERANGE && buffer.size() < 1024 * 1024) {
+        if (error == ERANGE && buffer.size() < std::size_t{1024} * 1024) {
             buffer.resize(buffer.size() * 2);  // the same entry comes again
             continue;
         }

@@ -11,7 +11,7 @@ namespace {
 constexpr int kUsageError = 2;
 
 int fail(const char *what, int error) {
-    fprintf(stderr, "veldnetdtool: the kernel does not tell its %s: %s\n", what, strerror(error));
+    (void)fprintf(stderr, "veldnetdtool: the kernel does not tell its %s: %s\n", what, strerror(error));
     return 1;
 }
 
@@ -19,10 +19,10 @@ int fail(const char *what, int error) {
 
 int main(int argc, char *argv[]) {
     if (argc != 3 || std::string_view(argv[1]) != "--get-ipv6-router-interface" || *argv[2] == '\0') {
-        fputs("usage: veldnetdtool --get-ipv6-router-interface INTERFACE\n"
-              "Prints, without a newline, the 6in4 (sit) tunnel whose local address belongs to INTERFACE,\n"
-              "or INTERFACE when there is none.\n",
-              stderr);
+        (void)fputs("usage: veldnetdtool --get-ipv6-router-interface INTERFACE\n"
+                    "Prints, without a newline, the 6in4 (sit) tunnel whose local address belongs to INTERFACE,\n"
+                    "or INTERFACE when there is none.\n",
+                    stderr);
         return kUsageError;
     }
     std::vector<veld::Link> links;
