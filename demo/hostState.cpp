@@ -22,6 +22,7 @@ namespace fs = std::filesystem;
 namespace demo {
 namespace {
 
+const std::string notReadable = ": not readable for this user";
 const std::vector<std::string> namespaceKinds = {"net", "mnt", "pid", "ipc", "uts", "user"};
 
 /// Everything that the demonstration writes to or replaces inside its sandbox.
@@ -63,7 +64,7 @@ std::string saveRules(const std::string &program) {
         return program + ": not installed\n";
     const auto saved = veldtest::runProgram({"/usr/sbin/" + program});
     if (!saved.succeeded())
-        return program + ": not readable for this user\n";
+        return program + notReadable + "\n";
     return program + ":\n" + withoutCounters(saved.output);
 }
 
@@ -188,7 +189,8 @@ int compareHost(const std::map<std::string, Measurement> &before, const std::map
     for (const auto &[title, old] : before) {
         const auto &now = after.at(title);
         const bool same = old.text == now.text;
-        std::printf("  %-28s %s (%zu lines compared)\n", title.c_str(), same ? "unchanged" : "CHANGED", old.items);
+        std::printf("  %-28s %s (%zu lines compared%s)\n", title.c_str(), same ? "unchanged" : "CHANGED", old.items,
+                    old.text.find(notReadable) == std::string::npos ? "" : "; rules are not readable for this user");
         if (same)
             continue;
         ++different;

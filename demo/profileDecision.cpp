@@ -8,7 +8,6 @@
 
 #include <algorithm>
 #include <array>
-#include <cstdlib>
 #include <stdexcept>
 #include <vector>
 
@@ -58,8 +57,8 @@ bool sourceMatches(const FW::FWRULE &rule, const std::string &source) {
 bool holdsPort(const std::vector<std::string> &ports, long port) {
     return std::any_of(ports.begin(), ports.end(), [&](const std::string &entry) {
         const size_t dash = entry.find('-');
-        const long low = std::atol(entry.c_str());
-        const long high = dash == std::string::npos ? low : std::atol(entry.c_str() + dash + 1);
+        const long low = std::stol(entry);
+        const long high = dash == std::string::npos ? low : std::stol(entry.substr(dash + 1));
         return low <= port && port <= high;
     });
 }

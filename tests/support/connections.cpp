@@ -208,6 +208,7 @@ bool echoStream(int handle) {
 [[noreturn]] void serve(const std::vector<int> &listeners, const std::vector<int> &datagrams, bool talking) {
     constexpr int talkInterval = 50;  // milliseconds
     std::vector<pollfd> entries;
+    entries.reserve(listeners.size() + datagrams.size());
     for (const int handle : listeners)
         entries.push_back({handle, POLLIN, 0});
     for (const int handle : datagrams)

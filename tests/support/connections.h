@@ -27,9 +27,9 @@ const char *toText(ProbeResult result);
 
 /// Where a probe goes and where it comes from.
 struct ProbeTarget {
-    std::string address;      ///< numeric, IPv4 or IPv6
-    uint16_t port = 0;        ///
-    std::string source = "";  ///< numeric source address; empty: the kernel's choice
+    std::string address;  ///< numeric, IPv4 or IPv6
+    uint16_t port = 0;
+    std::string source = {};  ///< numeric source address; empty: the kernel's choice
 };
 
 /// How long a probe waits when nothing else is said. Only packets that are dropped take that long.

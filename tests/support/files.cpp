@@ -37,9 +37,9 @@ void writeFile(const std::string &path, const std::string &text, mode_t mode) {
     while (done < text.size()) {
         const ssize_t count = write(file, text.data() + done, text.size() - done);
         if (count < 0) {
-            const auto error = systemError("write " + path);
+            const int error = errno;
             close(file);
-            throw error;
+            throw std::system_error(error, std::generic_category(), "write " + path);
         }
         done += static_cast<size_t>(count);
     }

@@ -77,6 +77,7 @@ int runInChild(const std::function<int()> &function) {
 
 ProgramResult runProgram(const std::vector<std::string> &command) {
     std::vector<char *> arguments;
+    arguments.reserve(command.size() + 1);
     for (const auto &word : command)
         arguments.push_back(const_cast<char *>(word.c_str()));
     arguments.push_back(nullptr);

@@ -47,7 +47,7 @@ static unsigned countRuns(int record) {
     unsigned runs = 0;
     for (const char *words; (words = nextField(&at, end)) != NULL; ++runs) {
         const char *handles = nextField(&at, end);
-        for (long left = atol(words) + (handles ? atol(handles) : 0); left > 0; --left)
+        for (long left = strtol(words, NULL, 10) + (handles ? strtol(handles, NULL, 10) : 0); left > 0; --left)
             nextField(&at, end);
     }
     free(text);
@@ -110,11 +110,11 @@ static void applyRules(unsigned run, const char *line) {
         if (value == NULL || code == NULL || words == NULL)
             break;
         if (strcmp(kind, "delay") == 0) {
-            const long milliseconds = atol(value);
+            const long milliseconds = strtol(value, NULL, 10);
             const struct timespec pause = {milliseconds / 1000, milliseconds % 1000 * 1000000};
             nanosleep(&pause, NULL);
-        } else if (strcmp(kind, "at") == 0 ? (unsigned)atol(value) == run : strstr(line, value) != NULL) {
-            status = atoi(code);
+        } else if (strcmp(kind, "at") == 0 ? (unsigned)strtol(value, NULL, 10) == run : strstr(line, value) != NULL) {
+            status = (int)strtol(code, NULL, 10);
             message = words;
         }
     }

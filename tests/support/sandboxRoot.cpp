@@ -211,7 +211,7 @@ void makeDevices() {
             continue;
         const std::string target = dev + "/" + name;
         fs::create_directories(fs::path(target).parent_path());
-        std::ofstream{target};
+        const std::ofstream created(target);
         mountOrThrow(source, target, nullptr, MS_BIND);
     }
     fs::create_symlink("/proc/self/fd", dev + "/fd");

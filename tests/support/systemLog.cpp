@@ -32,7 +32,7 @@ LogMessage parseLogDatagram(const std::string &datagram) {
     const size_t head = datagram.find('>');
     if (datagram.empty() || datagram[0] != '<' || head == std::string::npos)
         return message;
-    message.priority = LOG_PRI(std::atoi(datagram.c_str() + 1));
+    message.priority = LOG_PRI(static_cast<int>(std::strtol(datagram.c_str() + 1, nullptr, 10)));
     message.text = datagram.substr(std::min(head + 1 + timestampLength, datagram.size()));
     const size_t colon = message.text.find(": ");
     if (colon != std::string::npos) {
