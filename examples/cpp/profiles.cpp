@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Lists the stored profiles, adds a rule to one, and asks what the active one does with a port.
+// Lists the stored profiles, adds a rule to one or tries it first, and asks what the active one does with a port.
 #include <veldfirewall/veldFW.h>
 
 #include <exception>
@@ -13,7 +13,11 @@ namespace {
 enum ExitStatus { EXIT_OK = 0, EXIT_BLOCKED = 1, EXIT_USAGE = 2, EXIT_FAILED = 3 };
 
 const char usage[] = "usage: profiles list                             profiles, and how many rules each has\n"
+                     "       profiles on|off                           switch the firewall\n"
                      "       profiles deny PROFILE ADAPTER ADDRESS     put a rule in front that drops an IPv4 address\n"
+                     "       profiles try PROFILE ADAPTER ADDRESS      the same on trial, until a line is read from\n"
+                     "                [CLIENT]                         standard input: \"keep\" keeps it. The\n"
+                     "                                                 CLIENT's connections must stand the trial.\n"
                      "       profiles ask PORT tcp|udp                 is the destination port blocked, per adapter\n"
                      "exit status: 0 done or open, 1 blocked somewhere, 2 usage, 3 failed (see the system log)\n";
 
@@ -34,22 +38,61 @@ int list() {
     return EXIT_OK;
 }
 
-int deny(const std::string &name, const std::string &adapter, const std::string &address) {
-    FW::VELDFW_PROFILE store;
-    FW::FWPROFILE profile;
-    if (!store.profileGet(name, profile)) {
-        return EXIT_FAILED;
-    }
+int switchTo(bool on) {
+    FW::VELDFW firewall;
+    return (on ? firewall.fwEnable() : firewall.fwDisable()) ? EXIT_OK : EXIT_FAILED;
+}
+
+FW::FWRULE denyRule(const std::string &address) {
     FW::FWRULE rule;
     rule.name = "deny " + address;
     rule.policy = FW::FW_POLICY_DENY;
-    rule.ipGroup = 0;  // one address
+    rule.ipGroup = FW::FW_IP_GROUP_ADDRESS;
     rule.ipList = {address};
-    rule.portGroup = 3;  // any port
+    rule.portGroup = FW::FW_PORT_GROUP_ANY;
+    return rule;
+}
+
+bool withDenyRule(const std::string &name, const std::string &adapter, const std::string &address,
+                  FW::FWPROFILE &profile) {
+    if (!FW::VELDFW_PROFILE().profileGet(name, profile)) {
+        return false;
+    }
     auto &rules = profile.rules[adapter];
-    rules.insert(rules.begin(), rule);
+    rules.insert(rules.begin(), denyRule(address));
+    return true;
+}
+
+int deny(const std::string &name, const std::string &adapter, const std::string &address) {
+    FW::FWPROFILE profile;
     // The kernel follows at once when the firewall is on.
-    return store.profileSet(name, profile) && FW::VELDFW().fwReload(true) ? EXIT_OK : EXIT_FAILED;
+    return withDenyRule(name, adapter, address, profile) && FW::VELDFW_PROFILE().profileSet(name, profile) &&
+                   FW::VELDFW().fwReload(true)
+               ? EXIT_OK
+               : EXIT_FAILED;
+}
+
+int tryDeny(const std::string &name, const std::string &adapter, const std::string &address,
+            const std::string &client) {
+    FW::VELDFW firewall;
+    FW::VELDFW_PROFILE store;
+    FW::FWPROFILE profile;
+    if (!withDenyRule(name, adapter, address, profile) || !store.CreateTestProfile(name, profile)) {
+        return EXIT_FAILED;
+    }
+    bool succeeded = firewall.TestApplyingProfile(name, client);
+    std::string answer;
+    if (succeeded) {
+        std::cout << "on trial; \"keep\" keeps it, anything else brings the old rules back" << std::endl;
+        std::getline(std::cin, answer);
+    }
+    if (answer == "keep") {
+        succeeded = store.AdoptTestProfile(name);
+    }
+    // Both in any case: without the reload the trial would go on.
+    const bool removed = store.RemoveTestProfile(name);
+    const bool reloaded = firewall.fwReload(true);
+    return succeeded && removed && reloaded ? EXIT_OK : EXIT_FAILED;
 }
 
 int ask(const std::string &port, const std::string &protocol) {
@@ -78,8 +121,14 @@ int run(const std::vector<std::string> &words) {
     if (words.size() == 1 && words[0] == "list") {
         return list();
     }
+    if (words.size() == 1 && (words[0] == "on" || words[0] == "off")) {
+        return switchTo(words[0] == "on");
+    }
     if (words.size() == 4 && words[0] == "deny") {
         return deny(words[1], words[2], words[3]);
+    }
+    if ((words.size() == 4 || words.size() == 5) && words[0] == "try") {
+        return tryDeny(words[1], words[2], words[3], words.size() == 5 ? words[4] : "");
     }
     if (words.size() == 3 && words[0] == "ask" && (words[2] == "tcp" || words[2] == "udp")) {
         return ask(words[1], words[2]);

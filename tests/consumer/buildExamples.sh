@@ -3,6 +3,8 @@
 # Installs a build into a fresh folder, moves that folder, and builds and starts the examples against it while the
 # source tree is hidden (an empty file system is mounted over it in a private mount namespace).
 #
+# Leaves programs and installed tree in <build tree>/tests/consumer/<way>, where examplesTest.cpp runs them.
+#
 #   tests/consumer/buildExamples.sh find_package|pkg_config <source tree> <build tree>
 set -euo pipefail
 way=${1:?way} source_tree=${2:?source tree}
@@ -76,3 +78,9 @@ namespace=(unshare --mount)
 [[ $EUID -eq 0 ]] || namespace+=(--user --map-root-user)
 cd "$work"
 "${namespace[@]}" bash "$work/${BASH_SOURCE[0]##*/}" "$way" "$source_tree" hidden
+
+# The tests that run the programs find them, the installed tree and the shipped data here.
+kept=$build_tree/tests/consumer/$way
+rm -rf "$kept"
+mkdir -p "$kept"
+cp -a bin installed stage "$kept"
