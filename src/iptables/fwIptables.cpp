@@ -10,6 +10,7 @@
 #include <array>
 #include <cstdlib>
 #include <memory>
+#include <optional>
 #include <string_view>
 
 #include "adapters/adapterNames.h"
@@ -77,6 +78,18 @@ FWRULE defaultPolicyRule(FW_POLICY policy) {
     rule.ipGroup = FW_IP_GROUP_ANY;
     rule.portGroup = FW_PORT_GROUP_ANY;
     return rule;
+}
+
+/// An argument set without any fragment. It is copied for every rule: static keys are not.
+Json::Value emptyArguments() {
+    Json::Value args(Json::objectValue);
+    for (const char *key : {"adapter", "port", "chain", "table", "policy"}) {
+        args[Json::StaticString(key)] = Json::Value(Json::arrayValue);
+    }
+    Json::Value &ip = args[Json::StaticString("ip")];
+    ip[Json::StaticString("v4")] = Json::Value(Json::arrayValue);
+    ip[Json::StaticString("v6")] = Json::Value(Json::arrayValue);
+    return args;
 }
 
 void append(Json::Value &fragments, const std::vector<std::string> &texts) {
@@ -166,13 +179,8 @@ bool VELDFW_IPTABLES_RULES::adapterIsEnabled(const std::string &adapter) {
 }
 
 void VELDFW_IPTABLES_RULES::iptablesRulesInit(Json::Value &args) {
-    args = Json::Value(Json::objectValue);
-    for (const char *key : {"adapter", "port", "chain", "table", "policy"}) {
-        args[key] = Json::Value(Json::arrayValue);
-    }
-    Json::Value &ip = args["ip"];
-    ip["v4"] = Json::Value(Json::arrayValue);
-    ip["v6"] = Json::Value(Json::arrayValue);
+    static const Json::Value empty = emptyArguments();
+    args = empty;
 }
 
 bool VELDFW_IPTABLES_RULES::FwRuleToIptablesArg(const std::string &adapter, const FWRULE &rule, Json::Value &args) {
@@ -471,25 +479,40 @@ bool VELDFW_IPTABLES_RULES::fwRulesToIptablesRules(const bool &keepEstablished,
     }
     preambleAppend(keepEstablished, clientAddress, cmdList);
 
-    std::map<std::string, std::vector<FWRULE>> rulesWithDefaults = adapterRules;
+    // Kept apart from the rules, which may be many: each stands behind those of its adapter.
+    std::map<std::string, std::optional<FWRULE>> defaultRules;
+    for (const auto &[adapter, rules] : adapterRules) {
+        defaultRules[adapter] = std::nullopt;
+    }
     for (const auto &[adapter, policy] : adapterPolicyMap) {
         if (adapter != IGNORED_ADAPTER && adapterIsEnabled(adapter)) {
-            rulesWithDefaults[adapter].push_back(defaultPolicyRule(policy));
+            defaultRules[adapter] = defaultPolicyRule(policy);
         }
     }
-    for (const auto &[adapter, rules] : rulesWithDefaults) {
-        for (const FWRULE &rule : rules) {
-            if (!rule.enable || adapter == IGNORED_ADAPTER || !adapterIsEnabled(adapter) ||
-                rule.policy == FW_POLICY_NONE) {
-                continue;
+    const auto translate = [&](const std::string &adapter, const FWRULE &rule) {
+        if (!rule.enable || adapter == IGNORED_ADAPTER || !adapterIsEnabled(adapter) || rule.policy == FW_POLICY_NONE) {
+            return true;
+        }
+        Json::Value args;
+        iptablesRulesInit(args);
+        if (!FwRuleToIptablesArg(adapter, rule, args)) {
+            return false;
+        }
+        iptablesArgToCmd(adapter, rule, args, cmdList);
+        iptables6in4ToCmd(adapter, rule, cmdList);
+        return true;
+    };
+    for (const auto &[adapter, defaultRule] : defaultRules) {
+        const auto rules = adapterRules.find(adapter);
+        if (rules != adapterRules.end()) {
+            for (const FWRULE &rule : rules->second) {
+                if (!translate(adapter, rule)) {
+                    return false;
+                }
             }
-            Json::Value args;
-            iptablesRulesInit(args);
-            if (!FwRuleToIptablesArg(adapter, rule, args)) {
-                return false;
-            }
-            iptablesArgToCmd(adapter, rule, args, cmdList);
-            iptables6in4ToCmd(adapter, rule, cmdList);
+        }
+        if (defaultRule && !translate(adapter, *defaultRule)) {
+            return false;
         }
     }
     return true;
