@@ -9,6 +9,7 @@
 #include <chrono>
 #include <cstdlib>
 #include <ctime>
+#include <exception>
 #include <functional>
 #include <memory>
 #include <thread>
@@ -138,15 +139,31 @@ Json::Value profileDocument(FWPROFILE profile) {
 }  // namespace
 
 bool storedProfilesLoad(std::map<std::string, StoredProfile> &profiles) {
-    std::map<std::string, ProfileFile> files;
-    if (!profileScanOrLog([&](const std::string &name, ProfileFile &&file) { files[name] = std::move(file); })) {
+    // Decoded while the document is at hand: a document takes many times the memory of its profile. One that cannot be
+    // converted matters only if its file is the one that counts for the name.
+    struct Decoded {
+        StoredProfile stored;
+        std::exception_ptr fault;
+    };
+    std::map<std::string, Decoded> decoded;
+    const auto decode = [&](const std::string &name, ProfileFile &&file) {
+        Decoded entry;
+        entry.stored.path = profilePath(file.fileName);
+        try {
+            profileDecode(file.document, entry.stored.profile);
+        } catch (const Json::Exception &) {
+            entry.fault = std::current_exception();
+        }
+        decoded[name] = std::move(entry);
+    };
+    if (!profileScanOrLog(decode)) {
         return false;
     }
-    for (auto &[name, file] : files) {
-        StoredProfile &stored = profiles[name];
-        stored.path = profilePath(file.fileName);
-        profileDecode(file.document, stored.profile);
-        file.document = Json::Value();
+    for (auto &[name, entry] : decoded) {
+        if (entry.fault) {
+            std::rethrow_exception(entry.fault);
+        }
+        profiles[name] = std::move(entry.stored);
     }
     return true;
 }
