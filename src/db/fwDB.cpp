@@ -168,8 +168,8 @@ bool storedProfilesLoad(std::map<std::string, StoredProfile> &profiles) {
     return true;
 }
 
-bool storedProfileSave(const StoredProfile &stored) {
-    if (!jsonFileDump(profileDocument(stored.profile), stored.path)) {
+bool storedProfileSave(StoredProfile &&stored) {
+    if (!jsonFileDump(profileDocument(std::move(stored.profile)), stored.path)) {
         FW_LOG_ERR("Failed to profileDbDump()");
         return false;
     }

@@ -44,25 +44,27 @@ FWRULE ruleDecode(const Json::Value &json) {
 }
 
 // "ruleIndex" is the position and is never read back; "ruleID" is what a rule brings along and is never written.
+// Static keys are not copied, and there are many.
 Json::Value ruleEncode(const FWRULE &rule, unsigned position) {
     Json::Value json(Json::objectValue);
-    json["ruleIndex"] = position;
-    json["enable"] = rule.enable;
-    json["adapterDirect"] = rule.adapterDirect;
-    json["protocol"] = rule.protocol;
-    json["policy"] = static_cast<int>(rule.policy);
-    json["blLog"] = rule.blLog;
-    json["name"] = rule.name;
-    json["table"] = rule.table;
-    json["labelList"] = stringsEncode(rule.labelList);
-    json["chainList"] = stringsEncode(rule.chainList);
-    json["ipType"] = rule.ipType;
-    json["ipDirect"] = rule.ipDirect;
-    json["ipGroup"] = rule.ipGroup;
-    json["ipList"] = stringsEncode(rule.ipList);
-    json["portDirect"] = rule.portDirect;
-    json["portGroup"] = rule.portGroup;
-    json["portList"] = stringsEncode(rule.portList);
+    const auto member = [&json](const char *key) -> Json::Value & { return json[Json::StaticString(key)]; };
+    member("ruleIndex") = position;
+    member("enable") = rule.enable;
+    member("adapterDirect") = rule.adapterDirect;
+    member("protocol") = rule.protocol;
+    member("policy") = static_cast<int>(rule.policy);
+    member("blLog") = rule.blLog;
+    member("name") = rule.name;
+    member("table") = rule.table;
+    member("labelList") = stringsEncode(rule.labelList);
+    member("chainList") = stringsEncode(rule.chainList);
+    member("ipType") = rule.ipType;
+    member("ipDirect") = rule.ipDirect;
+    member("ipGroup") = rule.ipGroup;
+    member("ipList") = stringsEncode(rule.ipList);
+    member("portDirect") = rule.portDirect;
+    member("portGroup") = rule.portGroup;
+    member("portList") = stringsEncode(rule.portList);
     return json;
 }
 

@@ -17,8 +17,8 @@ struct StoredProfile {
 
 /// All profiles by name, with the files they lie in. @return false, logged, when the directory cannot be scanned
 bool storedProfilesLoad(std::map<std::string, StoredProfile> &profiles);
-/// Writes the profile back to its file, as VELDFW_JSON_DB::profileSet() would.
-bool storedProfileSave(const StoredProfile &stored);
+/// Writes the profile back to its file, as VELDFW_JSON_DB::profileSet() would. The rules are used up.
+bool storedProfileSave(StoredProfile &&stored);
 
 }  // namespace FW
 

@@ -402,8 +402,8 @@ bool VELDFW::fwUpdate() {
     for (auto &[name, stored] : profiles) {
         servicesRefresh(stored.profile, [&](const std::string &service) { return registry.kindOf(service); });
     }
-    for (const auto &[name, stored] : profiles) {
-        if (!storedProfileSave(stored)) {
+    for (auto &[name, stored] : profiles) {
+        if (!storedProfileSave(std::move(stored))) {
             FW_LOG_ERR("Failed to set profile");
             return false;
         }
@@ -594,7 +594,7 @@ bool VELDFW_PROFILE::profileAddServToReserve(const std::string &adapter, const s
     }
     for (auto &[name, stored] : profiles) {
         serviceReserve(stored.profile, adapter, servName, policy);
-        if (!storedProfileSave(stored)) {
+        if (!storedProfileSave(std::move(stored))) {
             FW_LOG_ERR("Failed to set profile");
             return false;
         }
@@ -614,7 +614,7 @@ bool VELDFW_PROFILE::profileRemoveServ(const std::string &servName) {
     }
     for (auto &[name, stored] : profiles) {
         serviceRemove(stored.profile, servName);
-        if (!storedProfileSave(stored)) {
+        if (!storedProfileSave(std::move(stored))) {
             FW_LOG_ERR("Failed to profile set [%s]", name.c_str());
             return false;
         }
@@ -638,7 +638,7 @@ bool VELDFW_PROFILE::profileChangeAdapter(const std::string &oldAdapter, const s
         if (adapterRename(stored.profile, oldAdapter, newAdapter) && name == activeProfile) {
             reloadDue = true;
         }
-        if (!storedProfileSave(stored)) {
+        if (!storedProfileSave(std::move(stored))) {
             FW_LOG_ERR("Failed to profile set [%s]", name.c_str());
             return false;
         }
