@@ -5,6 +5,7 @@ JOBS ?= $(shell nproc)
 PREFIX ?= /usr/local
 DESTDIR ?=
 FUZZ_SECONDS ?= 60
+BENCH_ARGS ?=
 
 # $(call build,<preset>[,<configure options>[,<build options>]]) configures and builds the preset in build-<preset>.
 build = cmake --preset $(1) --log-level=NOTICE $(2) && cmake --build --preset $(1) --parallel $(JOBS) $(3)
@@ -25,11 +26,11 @@ test: ## install what is needed, build, and run all tests
 	$(call build,dev)
 	ctest --preset dev --parallel $(JOBS)
 
-bench: ## measure; prints a table and writes out/bench.json
+bench: ## measure; prints a table, writes out/bench.json (BENCH_ARGS=--smoke: only a quick run)
 	scripts/install-dependencies.sh bench
 	$(call build,bench)
 	mkdir -p out
-	build-bench/bench/veld_bench --benchmark_out=out/bench.json --benchmark_out_format=json
+	build-bench/bench/veld_bench --benchmark_out=out/bench.json --benchmark_out_format=json $(BENCH_ARGS)
 
 lint: ## check format, static analysis (clang-tidy) and scripts
 	scripts/install-dependencies.sh lint
