@@ -9,8 +9,6 @@
 #include <syslog.h>
 #include <veldfirewall/veldFW.h>
 
-#include <regex>
-
 namespace veldtest {
 
 void storeSettings(bool enabled, const std::string &profile) {
@@ -77,12 +75,14 @@ FW::FWRULE serviceRule(FW::FW_POLICY policy, const std::vector<std::string> &ser
 }
 
 std::vector<std::string> errorsOf(SystemLog &log) {
-    static const std::regex form("^((?:fw\\w+|utils|veld\\w+)\\.cpp):[0-9]+ ([^]*)$");
     std::vector<std::string> errors;
     for (const LogMessage &message : log.messages()) {
-        std::smatch parts;
-        if (message.priority == LOG_ERR && std::regex_match(message.text, parts, form))
-            errors.push_back(parts[1].str() + " " + parts[2].str());
+        const size_t colon = message.text.find(".cpp:") + 4;
+        const size_t blank = message.text.find_first_not_of("0123456789", colon + 1);
+        const std::string source = message.text.substr(0, colon);
+        const bool isLibrary = source.rfind("fw", 0) == 0 || source.rfind("veld", 0) == 0 || source == "utils.cpp";
+        if (message.priority == LOG_ERR && isLibrary)
+            errors.push_back(source + message.text.substr(blank));
     }
     return errors;
 }
