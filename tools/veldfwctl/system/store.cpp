@@ -50,6 +50,18 @@ FW::FWPROFILE profileRead(const std::string &name) {
     return profile;
 }
 
+FW::FWPROFILE profileChosen(const std::string &named) {
+    if (!named.empty()) {
+        return profileRead(named);
+    }
+    try {
+        return profileRead(settingsRead().profile);
+    } catch (const UsageError &error) {
+        throw Failure(std::string("The active profile is missing: ") + error.what() +
+                      "; make one of them active with \"veldfwctl profile use NAME\"");
+    }
+}
+
 void profileWrite(const FW::FWPROFILE &profile) {
     require("Cannot store profile \"" + profile.name + "\"", LOOK_AT_STORE,
             [&profile] { return FW::VELDFW_PROFILE().profileSet(profile.name, profile); });

@@ -27,6 +27,10 @@ bool isTrialCopy(const std::string &profile);
 /// @throws UsageError when there is none of that name, Failure when it cannot be read
 FW::FWPROFILE profileRead(const std::string &name);
 
+/// The profile that an option names, or the active one when it names none.
+/// @throws UsageError as profileRead() does, Failure also when the active one is missing
+FW::FWPROFILE profileChosen(const std::string &named);
+
 /// Replaces the stored profile of the same name. @throws Failure
 void profileWrite(const FW::FWPROFILE &profile);
 

@@ -38,7 +38,7 @@ std::map<std::string, bool> interfaceStates() {
 }
 
 int list(const Context &context) {
-    const FW::FWPROFILE profile = profileRead(settingsRead().profile);
+    const FW::FWPROFILE profile = profileChosen("");
     std::set<std::string> names = adapterNames();
     const std::map<std::string, bool> states = interfaceStates();
     const std::set<std::string> words = {FW::FW_ADAPTER_GLOBAL, FW::FW_ADAPTER_PPPOE, FW::FW_ADAPTER_VPN};

@@ -11,8 +11,7 @@ namespace veldfwctl {
 namespace {
 
 int enable(const Context &context) {
-    const std::string profile = settingsRead().profile;
-    profileRead(profile);  // a missing profile is told before anything is switched
+    const std::string profile = profileChosen("").name;  // a missing profile is told before anything is switched
     applicationApply(context,
                      {"Switching the firewall on", "Cannot switch the firewall on with profile \"" + profile + "\"",
                       profile, [] { return FW::VELDFW().fwEnable(); }});

@@ -30,7 +30,7 @@ int set(const Context &context, const Options &options) {
     if (adapterNames().count(options.adapter) == 0) {
         context.warn("there is no adapter \"" + options.adapter + "\" now; its policy has no effect until there is");
     }
-    FW::FWPROFILE profile = profileRead(options.profile.empty() ? settingsRead().profile : options.profile);
+    FW::FWPROFILE profile = profileChosen(options.profile);
     profile.adapterPolicyMap[options.adapter] = policy;
     profileWrite(profile);
     context.print("Default policy of " + options.adapter + " in profile \"" + profile.name + "\" is " +

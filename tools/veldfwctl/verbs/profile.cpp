@@ -57,7 +57,7 @@ int list(const Context &context) {
 }
 
 int show(const Context &context, const Options &options) {
-    const FW::FWPROFILE profile = profileRead(options.name.empty() ? settingsRead().profile : options.name);
+    const FW::FWPROFILE profile = profileChosen(options.name);
     if (context.json) {
         Json::Value json;
         FW::VELDFW_PROFILE().profileToJson(profile, json);

@@ -40,10 +40,6 @@ SystemKnowledge systemKnowledge() {
     return system;
 }
 
-FW::FWPROFILE profileChosen(const Options &options) {
-    return profileRead(options.profile.empty() ? settingsRead().profile : options.profile);
-}
-
 /// Stores the changed profile, tells what was done with which rule, and applies it when asked to.
 /// @param done "Added"
 int changeFinish(const Context &context, const Options &options, const FW::FWPROFILE &profile, const std::string &done,
@@ -62,7 +58,7 @@ int changeFinish(const Context &context, const Options &options, const FW::FWPRO
 }
 
 int list(const Context &context, const Options &options) {
-    const FW::FWPROFILE profile = profileChosen(options);
+    const FW::FWPROFILE profile = profileChosen(options.profile);
     if (!context.json) {
         context.printTable(ruleTable(profile, options.adapter));
         return STATUS_DONE;
@@ -87,7 +83,7 @@ int list(const Context &context, const Options &options) {
 
 int add(const Context &context, const Options &options) {
     const FW::FWRULE rule = ruleFromRequest(options.request, systemKnowledge());
-    FW::FWPROFILE profile = profileChosen(options);
+    FW::FWPROFILE profile = profileChosen(options.profile);
     const size_t number = ruleInsert(profile, options.adapter, options.position, rule);
     if (adapterNames().count(options.adapter) == 0) {
         context.warn("there is no adapter \"" + options.adapter + "\" now; the rule has no effect until there is");
@@ -96,7 +92,7 @@ int add(const Context &context, const Options &options) {
 }
 
 int remove(const Context &context, const Options &options) {
-    FW::FWPROFILE profile = profileChosen(options);
+    FW::FWPROFILE profile = profileChosen(options.profile);
     const FW::FWRULE rule = ruleAt(profile, options.adapter, options.number);
     if (!context.confirm("Remove rule " + std::to_string(options.number) + " of " + options.adapter +
                          " from profile \"" + profile.name + "\": " + ruleText(rule) + "?")) {
@@ -107,14 +103,14 @@ int remove(const Context &context, const Options &options) {
 }
 
 int move(const Context &context, const Options &options) {
-    FW::FWPROFILE profile = profileChosen(options);
+    FW::FWPROFILE profile = profileChosen(options.profile);
     ruleMove(profile, options.adapter, options.number, options.newNumber);
     const FW::FWRULE rule = ruleAt(profile, options.adapter, options.newNumber);
     return changeFinish(context, options, profile, "Moved", static_cast<size_t>(options.newNumber), rule);
 }
 
 int enable(const Context &context, const Options &options, bool enabled) {
-    FW::FWPROFILE profile = profileChosen(options);
+    FW::FWPROFILE profile = profileChosen(options.profile);
     FW::FWRULE &rule = ruleAt(profile, options.adapter, options.number);
     rule.enable = enabled;
     const FW::FWRULE changed = rule;

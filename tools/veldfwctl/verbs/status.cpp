@@ -116,7 +116,7 @@ void statusPrint(const Context &context, const Settings &settings, const std::ve
 
 int status(const Context &context) {
     const Settings settings = settingsRead();
-    const std::vector<AdapterSummary> adapters = adapterSummaries(profileRead(settings.profile));
+    const std::vector<AdapterSummary> adapters = adapterSummaries(profileChosen(""));
     const KernelState kernel = kernelStateRead();
     const Families families = {{"IPv4", &kernel.v4}, {"IPv6", &kernel.v6}};
     if (context.json) {
