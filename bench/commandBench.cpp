@@ -10,6 +10,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <memory>
 #include <sstream>
 #include <vector>
@@ -48,11 +49,8 @@ Commands makeCommands(int count) {
 
 void spawnAll(Commands &commands) {
     for (auto &words : commands.words) {
-        std::vector<char *> arguments;
-        for (std::string &word : words) {
-            arguments.push_back(word.data());
-        }
-        arguments.push_back(nullptr);
+        std::vector<char *> arguments(words.size() + 1, nullptr);
+        std::transform(words.begin(), words.end(), arguments.begin(), [](std::string &word) { return word.data(); });
         pid_t process = -1;
         int status = 0;
         require(posix_spawn(&process, IPTABLES, nullptr, nullptr, arguments.data(), environ) == 0, "cannot start");
