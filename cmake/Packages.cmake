@@ -5,6 +5,7 @@ set(CPACK_COMPONENTS_ALL Library Runtime Development data)
 set(CPACK_PACKAGE_VENDOR "${PROJECT_NAME}")
 set(CPACK_PACKAGE_CONTACT "The ${PROJECT_NAME} developers <veldfirewall@localhost>")
 set(CPACK_PACKAGE_VERSION ${PROJECT_VERSION})
+set(CPACK_PACKAGE_DESCRIPTION_SUMMARY "")  # each package has its own; CPack would put a common one in front
 set(CPACK_STRIP_FILES ON)
 set(CPACK_SET_DESTDIR ON)  # some places are absolute; they must be staged too
 set(CPACK_RESOURCE_FILE_LICENSE ${PROJECT_SOURCE_DIR}/LICENSE)
@@ -36,5 +37,9 @@ veld_package(Development libveldfirewall-dev libdevel "${PROJECT_DESCRIPTION} (d
   "libveldfirewall1 ${same_version}, libveldplatform1 ${same_version}, libjsoncpp-dev, pkg-config")
 veld_package(data veldfirewall-common admin "Profile, service definitions and module list of the firewall" "")
 set(CPACK_DEBIAN_DATA_PACKAGE_ARCHITECTURE all)
+if(TARGET veldfwctl)
+  list(APPEND CPACK_COMPONENTS_ALL tool)
+  veld_package(tool veldfwctl admin "Administrator's tool of the firewall" "libveldfirewall1 ${same_version}")
+endif()
 
 include(CPack)
