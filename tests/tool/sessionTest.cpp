@@ -82,7 +82,7 @@ struct Run {
 
 class Session {
 public:
-    explicit Session(const std::string &file) : m_file(file) {}
+    explicit Session(std::string file) : m_file(std::move(file)) {}
 
     void play() {
         std::ifstream stream(m_file);
@@ -165,7 +165,7 @@ private:
             return;
         }
         ASSERT_FALSE(list.empty()) << profile.toStyledString();
-        const Json::Value rule = list[list.size() - 1];
+        const Json::Value &rule = list[list.size() - 1];
         const Json::Value expected = parseJson(text.substr(blank + 1));
         for (const std::string &member : expected.getMemberNames()) {
             EXPECT_EQ(expected[member].toStyledString(), rule[member].toStyledString()) << member;

@@ -34,6 +34,7 @@ public:
             noColor != nullptr ? setenv("NO_COLOR", noColor, 1) : unsetenv("NO_COLOR");
             arguments.insert(arguments.begin(), VELDFWCTL);
             std::vector<char *> words;
+            words.reserve(arguments.size() + 1);
             for (std::string &argument : arguments) {
                 words.push_back(argument.data());
             }

@@ -67,7 +67,7 @@ Json::Value parseJson(const std::string &text) {
 
 Json::Value storedProfile(const std::string &name) {
     for (const std::string &file : listDirectory(PROFILES)) {
-        const Json::Value document = parseJson(readFile(PROFILES + file));
+        Json::Value document = parseJson(readFile(PROFILES + file));
         if (document["name"] == name) {
             return document;
         }

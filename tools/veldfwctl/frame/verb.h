@@ -20,7 +20,7 @@ struct Verb {
     std::string example;           ///< command lines, one per line, shown by --help
     std::function<int()> run;      ///< gives an ExitStatus; throws UsageError or Failure
     bool asksForConsent = false;   ///< has --yes
-    std::string description = "";  ///< more about it, for --help
+    std::string description = {};  ///< more about it, for --help
 };
 
 /// Adds a verb with --help and --json to the application or to a group. Add its options to the result.

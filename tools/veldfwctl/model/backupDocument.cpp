@@ -84,7 +84,7 @@ std::vector<std::string> backupProblems(const Json::Value &document) {
     const Json::Value &files = document["config_profiles"];
     std::map<std::string, std::string> fileOfName;
     if (!files.isObject() || files.empty()) {
-        problems.push_back("\"config_profiles\" holds no profile");
+        problems.emplace_back("\"config_profiles\" holds no profile");
     } else {
         for (const std::string &file : files.getMemberNames()) {
             const std::string nameProblem = fileNameProblem(file);
