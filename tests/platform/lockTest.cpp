@@ -70,6 +70,7 @@ TEST(FileLock, SharersExcludeOnlyExclusiveHolders) {
 TEST(FileLock, ThreadsIncrementACounterWithoutLoss) {
     int counter = 0;
     std::vector<std::thread> threads;
+    threads.reserve(4);
     for (int i = 0; i < 4; ++i)
         threads.emplace_back([&] {
             for (int n = 0; n < 50; ++n) {
@@ -89,6 +90,7 @@ TEST(FileLock, ThreadsIncrementACounterWithoutLoss) {
 
 TEST(FileLock, FileUnlinkedUnderWaitersNeverLetsTwoIn) {
     std::vector<pid_t> children;
+    children.reserve(8);
     for (int i = 0; i < 8; ++i)
         children.push_back(startChild([i] {
             for (int n = 0; n < 60; ++n) {
@@ -185,6 +187,7 @@ TEST(FileLock, ManyProcessesReplacingAPlantedFileNeverLetTwoIn) {
         int gate[2];
         ASSERT_EQ(pipe(gate), 0);
         std::vector<pid_t> children;
+        children.reserve(6);
         for (int i = 0; i < 6; ++i)
             children.push_back(startChild([&gate] {
                 // All start at once, when the gate's last writer closes it.

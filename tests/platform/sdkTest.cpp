@@ -65,6 +65,7 @@ TEST(MkdirP, FailuresSetErrno) {
 
 TEST(MkdirP, ManyCreatorsAtOnceAllSucceed) {
     std::vector<pid_t> children;
+    children.reserve(8);
     for (int i = 0; i < 8; ++i)
         children.push_back(startChild([] {
             for (int n = 0; n < 50; ++n) {

@@ -164,7 +164,7 @@ TEST(ServiceRegistry, HostileFilesAreNamedAndSkipped) {
 TEST(ServiceRegistry, NothingDefinedIsAFailureWithoutAHandle) {
     SystemLog log;
     writeFile("/etc/services", "");
-    VELDFWSERVICE_HANDLE handle = reinterpret_cast<VELDFWSERVICE_HANDLE>(&log);
+    auto handle = reinterpret_cast<VELDFWSERVICE_HANDLE>(&log);
     EXPECT_EQ(VELDFwServiceEnum(&handle), 0);
     EXPECT_EQ(handle, nullptr);
     EXPECT_EQ(VELDFWServiceFind(handle, "ssh"), nullptr);
