@@ -88,7 +88,7 @@ public:
     /// "status" is a bool and whose "profile" is one of those names.
     /// @return false when the store cannot be scanned or the settings cannot be written; a profile that cannot be
     ///         deleted or written is logged and the import goes on
-    /// @throws Json::LogicError when "config_profiles" or the settings are of a type that cannot hold members
+    /// @throws Json::LogicError, before anything is deleted, when `in` is neither an object nor null
     bool importConfig(const Json::Value &in);
 };
 

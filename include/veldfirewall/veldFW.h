@@ -114,7 +114,10 @@ public:
     /// The same with an empty client address.
     bool TestApplyingProfile(std::string name);
 
-    // Block queries: what the active profile says, without a look at the kernel
+    // Block queries: what the active profile says, without a look at the kernel. A stored document that cannot be
+    // converted makes them fail, without an exception. They answer exactly where rules of all addresses decide; of
+    // several rules for some addresses they tell only a coarse verdict: a profile that allows one network and then
+    // denies everything, on an adapter whose default is to allow, is reported as denied.
 
     /// Tells per adapter whether a port is blocked: FW_POLICY_ALLOW, _DENY, _PARTIAL (for some source addresses), or
     /// _NONE (only for "global": no decision).
@@ -154,7 +157,7 @@ public:
     bool RemoveTestProfile(std::string name);
 
     // Edits of all stored profiles. Each profile is written by itself: a failure half-way leaves those before it
-    // changed.
+    // changed. A stored document that cannot be converted makes them fail, without an exception.
 
     /// Makes the front rule of `adapter`'s list in every profile a reserved rule of `policy` that names the service,
     /// and takes the service out of the list's other reserved rules. Rules left without a service are dropped.

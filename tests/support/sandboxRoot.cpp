@@ -255,6 +255,17 @@ void mountKernelDirectories() {
     }
 }
 
+/// Kernel modules belong to the whole machine: without a list of what is there and what is loaded, none is loaded or
+/// removed. The kernel itself still loads what a rule needs.
+void hideKernelModules() {
+    for (const char *directory : {"/sys/module", "/usr/lib/modules"}) {
+        const std::string target = newRoot + directory;
+        std::error_code error;
+        if (fs::is_directory(target, error))
+            mountOrThrow("tmpfs", target, "tmpfs", 0, "mode=755");
+    }
+}
+
 void switchToNewRoot(bool keepHost) {
     const std::string old = newRoot + hostRoot;
     fs::create_directories(old);
@@ -286,6 +297,7 @@ bool enterPrivateRoot(bool ownsFiles) {
     mountFreshDirectories();
     putBackKeptDirectories(kept);
     mountKernelDirectories();
+    hideKernelModules();
     switchToNewRoot(!overlay);
     if (chdir(directory.c_str()) != 0 && chdir("/") != 0)
         throw systemError("chdir /");

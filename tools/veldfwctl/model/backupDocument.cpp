@@ -15,7 +15,7 @@ namespace {
 constexpr int VERSION = 1;
 constexpr const char *SETTINGS_FILE = "firewall_settings.json";
 
-std::string quoted(const std::string &text) {
+std::string inQuotes(const std::string &text) {
     return Json::valueToQuotedString(text.c_str());
 }
 
@@ -48,7 +48,7 @@ std::string profileProblem(const Json::Value &profile) {
     for (auto list = profile["rules"].begin(); list != profile["rules"].end(); ++list) {
         if (!list->isArray() ||
             !std::all_of(list->begin(), list->end(), [](const Json::Value &r) { return r.isObject(); })) {
-            return "has rules of " + quoted(list.name()) + " that are no list of objects";
+            return "has rules of " + inQuotes(list.name()) + " that are no list of objects";
         }
     }
     try {
@@ -90,13 +90,14 @@ std::vector<std::string> backupProblems(const Json::Value &document) {
             const std::string nameProblem = fileNameProblem(file);
             const std::string problem = nameProblem.empty() ? profileProblem(files[file]) : nameProblem;
             if (!problem.empty()) {
-                problems.push_back(quoted(file) + " in \"config_profiles\" " + problem);
+                problems.push_back(inQuotes(file) + " in \"config_profiles\" " + problem);
                 continue;
             }
             const std::string name = files[file]["name"].asString();
             const auto [known, isNew] = fileOfName.try_emplace(name, file);
             if (!isNew) {
-                problems.push_back(quoted(known->second) + " and " + quoted(file) + " are both named " + quoted(name));
+                problems.push_back(inQuotes(known->second) + " and " + inQuotes(file) + " are both named " +
+                                   inQuotes(name));
             }
         }
     }
@@ -104,7 +105,7 @@ std::vector<std::string> backupProblems(const Json::Value &document) {
     if (!settings.isObject() || !settings["status"].isBool() || !settings["profile"].isString()) {
         problems.emplace_back("\"config_firewall_settings\" lacks \"status\" (true or false) or \"profile\" (a name)");
     } else if (fileOfName.count(settings["profile"].asString()) == 0) {
-        problems.push_back("the active profile " + quoted(settings["profile"].asString()) + " is not in it");
+        problems.push_back("the active profile " + inQuotes(settings["profile"].asString()) + " is not in it");
     }
     return problems;
 }
