@@ -35,7 +35,8 @@ bench: ## measure; prints a table, writes out/bench.json (BENCH_ARGS=--smoke: on
 lint: ## check format, static analysis (clang-tidy) and scripts
 	scripts/install-dependencies.sh lint
 	scripts/lint.sh
-	$(call build,tidy,,-- -k 0)
+	cmake --preset tidy --log-level=NOTICE
+	run-clang-tidy -quiet -p build-tidy -j $(JOBS) 2>&1 | { grep -vE '^([0-9]+ warnings generated\.|)$$' || true; }; exit $${PIPESTATUS[0]}
 
 format: ## rewrite the sources in the project's format
 	scripts/install-dependencies.sh lint

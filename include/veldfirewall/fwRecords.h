@@ -3,6 +3,7 @@
 #ifndef VELDFIREWALL_FWRECORDS_H
 #define VELDFIREWALL_FWRECORDS_H
 
+#include <array>
 #include <cstdint>
 #include <map>
 #include <set>
@@ -57,6 +58,7 @@ inline constexpr const char *FW_ADAPTER_VPN = "vpn";
 /// The chains of the table "filter" that belong to the firewall; INPUT and FORWARD jump to them.
 inline constexpr const char *FW_CHAIN_INPUT = "INPUT_FIREWALL";
 inline constexpr const char *FW_CHAIN_FORWARD = "FORWARD_FIREWALL";
+inline constexpr std::array<const char *, 2> FW_CHAINS = {FW_CHAIN_INPUT, FW_CHAIN_FORWARD};
 
 /// One rule of an adapter's list. The defaults are those of a new rule; the field names are the keys of a stored rule.
 struct FWRULE {

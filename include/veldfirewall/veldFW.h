@@ -63,8 +63,14 @@ public:
     // Lifecycle
 
     /// Loads the kernel modules, announces the switch (hooks), stores it and applies the active profile.
+    /// @return false when the modules cannot be loaded (nothing is changed then), or after a failed reload: of a
+    /// refused
+    ///         command the firewall is off again; of a profile that cannot be read or translated the switch stays on,
+    ///         with empty chains
     bool fwEnable();
-    /// Announces the switch, flushes the firewall chains, unloads the kernel modules and stores the switch.
+    /// Announces the switch, flushes the firewall chains, unloads the kernel modules and stores the switch. Goes on
+    /// past every failure; the policies of the built-in chains stay as they are.
+    /// @return whether the switch could be stored
     bool fwDisable();
     /// Same as fwDisable().
     bool fwReset();
@@ -86,7 +92,7 @@ public:
     /// Sets it to ACCEPT.
     bool fwDefaultAccept();
     /// Removes services that the system no longer knows from every stored profile, and sets the protocol of service
-    /// rules to that of their services. Does not reload.
+    /// rules to that of their services. Writes every profile, changed or not. Does not reload.
     bool fwUpdate();
 
     // Building commands
@@ -100,7 +106,8 @@ public:
     bool fwIptablesRulesEnum(std::string profileName, Json::Value &commands, const char *clientAddress) {
         return fwIptablesRulesEnum(std::move(profileName), commands, std::string(clientAddress));
     }
-    /// Adds the names of all adapters that rules can be bound to: interfaces, "global", "pppoe" and "vpn".
+    /// Adds the names of all adapters that rules can be bound to: at most 32 interfaces, "wlan0" where the system
+    /// supports wireless, "global", "pppoe" and "vpn".
     bool fwAdapterEnum(std::set<std::string> &adapters);
 
     // Trying a profile

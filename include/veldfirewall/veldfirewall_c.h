@@ -3,7 +3,8 @@
  * Plain functions for programs that do not use the classes; C11 and C++.
  *
  * Strings are NUL-terminated, read only during the call and never kept. Unless a function says otherwise it returns 0
- * on success and -1 on failure, and the reason is in the system log. Calls block until the work is done.
+ * on success and -1 on failure, and the reason is in the system log, except for a NULL or empty argument. Calls block
+ * until the work is done. Nothing is thrown.
  */
 #ifndef VELDFIREWALL_C_H
 #define VELDFIREWALL_C_H
@@ -21,7 +22,8 @@ VELDFIREWALL_API int VELDFwRuleHup(void);
 /* Switches the firewall off. A failure is only in the log. */
 VELDFIREWALL_API void VELDFwReset(void);
 
-/* Takes a service out of every rule of every profile; does not reload. NULL gives -1. */
+/* Takes a service out of every service rule of every profile; rules left without one are dropped. Does not reload. NULL
+ * gives -1. */
 VELDFIREWALL_API int VLIBFwServRemoveRec(const char *servName);
 
 /* Moves rules and default policy of one adapter to another name in every profile; reload == 1 applies the active

@@ -12,6 +12,7 @@
 #include <exception>
 #include <functional>
 #include <memory>
+#include <set>
 #include <thread>
 
 #include "db/profileCodec.h"
@@ -121,12 +122,12 @@ bool profileFileStore(VELDFW_JSON_DB &db, const std::string &name, const Json::V
     }
 }
 
-bool metaCreateOrLog(VELDFW_JSON_DB &db, Json::Value &meta) {
-    if (!db.profileMetaCreate(meta)) {
-        FW_LOG_ERR("Failed to create meta json from %s", PROFILE_DIRECTORY);
-        return false;
-    }
-    return true;
+/// A visitor that notes each profile's file name in `meta`.
+std::function<void(const std::string &, ProfileFile &&)> metaFill(Json::Value &meta) {
+    return [&meta](const std::string &name, ProfileFile &&file) {
+        meta[name] = Json::Value(Json::objectValue);
+        meta[name]["fileName"] = file.fileName;
+    };
 }
 
 Json::Value profileDocument(FWPROFILE profile) {
@@ -193,15 +194,12 @@ void VELDFW_JSON_DB::ruleListToJson(const std::map<std::string, std::vector<FWRU
 }
 
 bool VELDFW_JSON_DB::profileMetaCreate(Json::Value &meta) {
-    return profileScan([&](const std::string &name, ProfileFile &&file) {
-        meta[name] = Json::Value(Json::objectValue);
-        meta[name]["fileName"] = file.fileName;
-    });
+    return profileScan(metaFill(meta));
 }
 
 bool VELDFW_JSON_DB::profileEnum(std::vector<std::string> &names) {
     Json::Value meta(Json::objectValue);
-    if (!metaCreateOrLog(*this, meta)) {
+    if (!profileScanOrLog(metaFill(meta))) {
         return false;
     }
     const std::vector<std::string> members = meta.getMemberNames();
@@ -233,7 +231,7 @@ std::string VELDFW_JSON_DB::profilePathNameGen(const Json::Value &meta) {
     }
     for (int attempt = 1;; ++attempt) {
         // Not seeded: a number that another process draws as well is noticed when the file is created.
-        const std::string candidate = std::to_string(std::time(nullptr) + std::rand() % FILE_NAME_CANDIDATES);
+        std::string candidate = std::to_string(std::time(nullptr) + std::rand() % FILE_NAME_CANDIDATES);
         if (taken.count(candidate) == 0) {
             return candidate;
         }
@@ -249,7 +247,7 @@ bool VELDFW_JSON_DB::profileDbLoad(const std::string &name, Json::Value &json) {
 
 bool VELDFW_JSON_DB::profileDbDump(const std::string &name, const Json::Value &json) {
     Json::Value meta(Json::objectValue);
-    return metaCreateOrLog(*this, meta) && profileFileStore(*this, name, json, std::move(meta));
+    return profileScanOrLog(metaFill(meta)) && profileFileStore(*this, name, json, std::move(meta));
 }
 
 bool VELDFW_JSON_DB::profileDbRemove(const std::string &name) {
@@ -284,7 +282,7 @@ bool VELDFW_JSON_DB::profileSet(const std::string &name, const FWPROFILE &profil
 
 bool VELDFW_JSON_DB::profileCreate(const std::string &name) {
     Json::Value meta(Json::objectValue);
-    const bool scanned = metaCreateOrLog(*this, meta);
+    const bool scanned = profileScanOrLog(metaFill(meta));
     if (meta.isMember(name)) {
         FW_LOG_ERR("The profile %s already exist", name.c_str());
         return false;

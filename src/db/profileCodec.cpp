@@ -72,11 +72,12 @@ Json::Value ruleEncode(const FWRULE &rule, unsigned position) {
 
 void rulesDecode(const Json::Value &json, std::map<std::string, std::vector<FWRULE>> &rules) {
     for (auto adapter = json.begin(); adapter != json.end(); ++adapter) {
-        if (adapter->size() == 0) {  // a scalar as well
+        const Json::ArrayIndex count = adapter->size();  // 0 of a scalar as well
+        if (count == 0) {
             continue;
         }
         std::vector<FWRULE> &list = rules[adapter.name()];
-        list.reserve(list.size() + adapter->size());
+        list.reserve(list.size() + count);
         for (const Json::Value &rule : *adapter) {
             list.push_back(ruleDecode(rule));
         }

@@ -8,14 +8,13 @@
 #include <boost/algorithm/string/split.hpp>
 
 #include <algorithm>
-#include <exception>
-#include <functional>
 #include <map>
 #include <string>
 #include <vector>
 
 #include "utils/log.h"
 #include "utils/platformError.h"
+#include "utils/runOrLog.h"
 #include "veldfirewall/veldFW.h"
 
 namespace {
@@ -25,18 +24,9 @@ constexpr int ALLOWED = 1;
 constexpr int NOT_ALLOWED = 0;
 constexpr int RELOAD = 1;
 
-/// A C program cannot catch what the libraries below throw, such as for a stored document of wrong types.
-bool runOrLog(const std::function<bool()> &operation) {
-    try {
-        return operation();
-    } catch (const std::exception &error) {
-        FW_LOG_ERR("Ended by an exception: %s", error.what());
-        return false;
-    }
-}
-
-int statusOf(const std::function<bool()> &operation) {
-    return runOrLog(operation) ? 0 : -1;
+// Nothing is thrown out of these functions: a C program could not catch it.
+template <typename Operation> int statusOf(const Operation &operation) {
+    return FW_RUN_OR_LOG(operation) ? 0 : -1;
 }
 
 }  // namespace
@@ -46,7 +36,7 @@ int VELDFwRuleHup(void) {
 }
 
 void VELDFwReset(void) {
-    runOrLog([] { return FW::VELDFW().fwReset(); });
+    FW_RUN_OR_LOG([] { return FW::VELDFW().fwReset(); });
 }
 
 int VLIBFwServRemoveRec(const char *servName) {
@@ -71,7 +61,7 @@ int VELDFwPortsCheckAllowByAdapter(const char *adapter, const char *servName) {
         return -1;
     }
     std::map<std::string, FW::FW_POLICY> verdicts;
-    if (!runOrLog(
+    if (!FW_RUN_OR_LOG(
             [&] { return FW::VELDFW().fwServIsBlocked(servName, adapter == nullptr ? "" : adapter, verdicts); })) {
         FW_LOG_ERR("Failed to check %s is block or not", servName);
         return -1;
@@ -92,14 +82,14 @@ int VLIBFwRuleReserveServInsert(const char *servList, int allow, int reload) {
     boost::algorithm::split(services, std::string(servList), boost::algorithm::is_any_of(","),
                             boost::algorithm::token_compress_on);
     for (const std::string &service : services) {
-        if (!runOrLog([&] {
+        if (!FW_RUN_OR_LOG([&] {
                 return FW::VELDFW_PROFILE().profileAddServToReserve(FW::FW_ADAPTER_GLOBAL, service, policy, false);
             })) {
             FW_LOG_ERR("Failed to assign serv [%s]", service.c_str());
             return -1;
         }
     }
-    if (reload == RELOAD && !runOrLog([] { return FW::VELDFW().fwReload(true); })) {
+    if (reload == RELOAD && !FW_RUN_OR_LOG([] { return FW::VELDFW().fwReload(true); })) {
         FW_LOG_ERR("Failed to reload firewall");
         return -1;
     }

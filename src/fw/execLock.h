@@ -5,33 +5,28 @@
 
 #include <veld/core.h>
 
-#include "utils/log.h"
-
 namespace FW {
 
 /// Keeps other processes from changing the kernel's rules, as long as it lives.
 class ExecLock {
 public:
     /// Waits up to 30 seconds.
-    ExecLock() : taken(VLIBCFileLockTimeByFile(LOCK_FILE, EXCLUSIVE, LOCK_SECONDS, &descriptor) != 0) {
-        if (!taken) {
-            logMessage(LOG_ERR, LOG_SOURCE, __LINE__, "TIMEOUT: getting lock");
-        }
-    }
-    ~ExecLock() {
-        if (taken && descriptor >= 0 && VLIBCFileUnlockByFile(descriptor) == 0) {
-            logMessage(LOG_ERR, LOG_SOURCE, __LINE__, "Failed to unlock");
-        }
-    }
+    ExecLock() : taken(VLIBCFileLockTimeByFile(LOCK_FILE, EXCLUSIVE, LOCK_SECONDS, &descriptor) != 0) {}
+    ~ExecLock() { release(); }
     ExecLock(const ExecLock &) = delete;
     ExecLock &operator=(const ExecLock &) = delete;
 
-    /// False, logged, when others held it all the time.
+    /// False when others held it all the time.
     bool isTaken() const { return taken; }
+    /// @return false when a lock that was taken cannot be released
+    bool release() {
+        const int releasing = taken ? descriptor : -1;
+        taken = false;
+        return releasing < 0 || VLIBCFileUnlockByFile(releasing) != 0;
+    }
 
 private:
     static constexpr const char *LOCK_FILE = "/tmp/firewall_iptables_exec.lock";
-    static constexpr const char *LOG_SOURCE = "veldFW.cpp";  // the messages are the controller's
     static constexpr int EXCLUSIVE = 1;
     static constexpr int LOCK_SECONDS = 30;
 

@@ -204,6 +204,7 @@ bool VELDFW::fwReloadAtomic(bool keepEstablished, FwApplyFailure &failure) {
     FwApplyFailure found;
     const ExecLock lock;
     if (!lock.isTaken()) {
+        FW_LOG_ERR("TIMEOUT: getting lock");
         failure.message = "another process holds the lock of the kernel's rules";
         return false;
     }

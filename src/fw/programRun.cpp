@@ -40,6 +40,7 @@ std::string contentOf(const Descriptor &file) {
 
 int spawn(const std::vector<std::string> &command, int in, int out, int err, pid_t &process) {
     std::vector<char *> arguments;
+    arguments.reserve(command.size() + 1);
     for (const std::string &argument : command) {
         arguments.push_back(const_cast<char *>(argument.c_str()));
     }

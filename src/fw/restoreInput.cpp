@@ -16,7 +16,6 @@ namespace FW {
 namespace {
 
 constexpr const char *FILTER_TABLE = "filter";
-constexpr std::array<const char *, 2> FIREWALL_CHAINS = {FW_CHAIN_INPUT, FW_CHAIN_FORWARD};
 
 struct Append {
     size_t command;  ///< index in the commands given
@@ -97,7 +96,7 @@ void lineAppend(RestoreInput &input, const std::string &line, size_t command = R
 void sectionAppend(RestoreInput &input, const std::string &table, const std::vector<Append> &appends) {
     lineAppend(input, "*" + table);
     if (table == FILTER_TABLE) {
-        for (const char *chain : FIREWALL_CHAINS) {
+        for (const char *chain : FW_CHAINS) {
             lineAppend(input, std::string("-F ") + chain);
         }
     }
@@ -166,7 +165,7 @@ size_t restoreFailedLine(const std::string &printed) {
 
 std::string restoreInputOfSaved(const std::string &saved) {
     std::string text = std::string("*") + FILTER_TABLE + "\n";
-    for (const char *chain : FIREWALL_CHAINS) {
+    for (const char *chain : FW_CHAINS) {
         text += std::string("-F ") + chain + "\n";
     }
     bool inFilter = false;
@@ -179,7 +178,7 @@ std::string restoreInputOfSaved(const std::string &saved) {
         }
         // With counters: "[packets:bytes] -A CHAIN ..."
         const size_t rule = line[0] == '[' ? std::min(line.find(' '), line.size() - 1) + 1 : 0;
-        for (const char *chain : FIREWALL_CHAINS) {
+        for (const char *chain : FW_CHAINS) {
             const std::string start = std::string("-A ") + chain + " ";
             if (inFilter && line.compare(rule, start.size(), start) == 0) {
                 text += line + "\n";
@@ -207,7 +206,7 @@ std::string restoreInputOfRemoval(const RestoreInput &input) {
 
 std::string restoreInputOfTrial(const RestoreInput &input, size_t lines) {
     std::string text = std::string("*") + FILTER_TABLE + "\n";
-    for (const char *chain : FIREWALL_CHAINS) {
+    for (const char *chain : FW_CHAINS) {
         text += std::string(":") + chain + " - [0:0]\n";
     }
     size_t begin = 0;

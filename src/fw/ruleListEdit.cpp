@@ -8,8 +8,6 @@ namespace FW {
 
 namespace {
 
-enum { SERVICE_KIND_TCP = 1, SERVICE_KIND_UDP = 2 };
-
 bool isReservedRule(const FWRULE &rule) {
     return rule.portGroup == FW_PORT_GROUP_RESERVED && rule.ipGroup == FW_IP_GROUP_ANY;
 }
@@ -57,8 +55,8 @@ void serviceRuleRefresh(FWRULE &rule, const ServiceKind &kindOf) {
     bool hasUdp = false;
     const auto isGone = [&](const std::string &service) {
         const int kind = kindOf(service);
-        hasTcp = hasTcp || kind == SERVICE_KIND_TCP;
-        hasUdp = hasUdp || kind == SERVICE_KIND_UDP;
+        hasTcp = hasTcp || kind == FW_PROTO_TCP;
+        hasUdp = hasUdp || kind == FW_PROTO_UDP;
         return kind < 0;
     };
     std::vector<std::string> &services = rule.portList;

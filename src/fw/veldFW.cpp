@@ -21,6 +21,7 @@
 #include "settings/fwSettings.h"
 #include "utils/log.h"
 #include "utils/platformError.h"
+#include "utils/runOrLog.h"
 #include "veldfirewall/fwHook.h"
 #include "veldfirewall/fwIptables.h"
 #include "veldfirewall/veldIptablesModule.h"
@@ -28,8 +29,6 @@
 namespace FW {
 
 namespace {
-
-constexpr std::array<const char *, 2> FIREWALL_CHAINS = {FW_CHAIN_INPUT, FW_CHAIN_FORWARD};
 
 constexpr const char *MODULE_OWNER = "firewall";
 const std::vector<std::string> FIREWALL_MODULES = {"compat_xtables.ko", "xt_geoip.ko", "xt_mac.ko"};
@@ -99,6 +98,35 @@ bool rulesReplace(VELDFW &firewall, const std::function<bool(Json::Value &comman
     return outcome;
 }
 
+/// Applies the active profile if the firewall is on; the caller holds the lock of the kernel's rules.
+bool lockedReload(VELDFW &firewall, bool keepEstablished) {
+    bool enabled = false;
+    if (!firewall.fwStatus(enabled)) {
+        FW_LOG_ERR("Failed to check status");
+        return false;
+    }
+    if (!enabled) {
+        return true;
+    }
+    if (!firewallModLoad()) {
+        FW_LOG_ERR("Failed to firewallModLoad()");
+        return false;
+    }
+    return rulesReplace(firewall, [&](Json::Value &commands) {
+        firewall.fwClear();
+        std::string profileName;
+        if (!firewall.fwProfileConfigGet(profileName)) {
+            FW_LOG_ERR("Failed to fwProfileConfigGet()");
+            return false;
+        }
+        if (!firewall.fwIptablesRulesEnum(profileName, commands, keepEstablished)) {
+            FW_LOG_ERR("Failed to fwIptablesRulesEnum()");
+            return false;
+        }
+        return true;
+    });
+}
+
 /// Runs a switch and then its post hook with the outcome: false when an exception leaves the switch.
 bool switchWithPostHook(const std::function<bool()> &switchOver, const std::function<void(bool)> &postHook) {
     bool outcome = false;
@@ -112,17 +140,6 @@ bool switchWithPostHook(const std::function<bool()> &switchOver, const std::func
     return outcome;
 }
 
-/// Runs what reads stored documents. One that cannot be converted, or a lock file that cannot be opened, is a failure
-/// of the operation and no business of its caller.
-bool readOrLog(const std::function<bool()> &read) {
-    try {
-        return read();
-    } catch (const std::exception &error) {
-        FW_LOG_ERR("The stored configuration cannot be read: %s", error.what());
-        return false;
-    }
-}
-
 /// What block queries ask: the switch and the profile in force, read once for all ports of a service.
 struct ProfileInForce {
     bool enabled = false;
@@ -131,7 +148,7 @@ struct ProfileInForce {
     bool read() {
         Json::Value settings;
         const auto statusRead = [&] { return settingsGetOrLog(settings) && settingsStatus(settings, enabled); };
-        if (!readOrLog(statusRead)) {
+        if (!FW_RUN_OR_LOG(statusRead)) {
             FW_LOG_ERR("Failed to check firewall status");
             return false;
         }
@@ -143,7 +160,7 @@ struct ProfileInForce {
             FW_LOG_ERR("Failed to fwProfileConfigGet()");
             return false;
         }
-        if (!readOrLog([&] { return VELDFW_PROFILE().profileGet(name, profile); })) {
+        if (!FW_RUN_OR_LOG([&] { return VELDFW_PROFILE().profileGet(name, profile); })) {
             FW_LOG_ERR("Failed to profileGet(%s)", name.c_str());
             return false;
         }
@@ -327,40 +344,21 @@ bool VELDFW::fwReset() {
 }
 
 bool VELDFW::fwReload(bool keepEstablished) {
-    const ExecLock lock;
+    ExecLock lock;
     if (!lock.isTaken()) {
+        FW_LOG_ERR("TIMEOUT: getting lock");
         return false;
     }
-    bool enabled = false;
-    if (!fwStatus(enabled)) {
-        FW_LOG_ERR("Failed to check status");
-        return false;
+    const bool outcome = lockedReload(*this, keepEstablished);
+    if (!lock.release()) {
+        FW_LOG_ERR("Failed to unlock");
     }
-    if (!enabled) {
-        return true;
-    }
-    if (!firewallModLoad()) {
-        FW_LOG_ERR("Failed to firewallModLoad()");
-        return false;
-    }
-    return rulesReplace(*this, [&](Json::Value &commands) {
-        fwClear();
-        std::string profileName;
-        if (!fwProfileConfigGet(profileName)) {
-            FW_LOG_ERR("Failed to fwProfileConfigGet()");
-            return false;
-        }
-        if (!fwIptablesRulesEnum(profileName, commands, keepEstablished)) {
-            FW_LOG_ERR("Failed to fwIptablesRulesEnum()");
-            return false;
-        }
-        return true;
-    });
+    return outcome;
 }
 
 bool VELDFW::fwClear() {
     bool cleared = true;
-    for (const char *chain : FIREWALL_CHAINS) {
+    for (const char *chain : FW_CHAINS) {
         for (const char *program : {IPTABLES_PROGRAM, IP6TABLES_PROGRAM}) {
             const std::string commandLine = std::string(program) + " -F " + chain;
             if (!cmdExec(commandLine)) {
@@ -588,18 +586,18 @@ bool VELDFW_PROFILE::RemoveTestProfile(std::string name) {
 bool VELDFW_PROFILE::profileAddServToReserve(const std::string &adapter, const std::string &servName, FW_POLICY policy,
                                              bool reload) {
     std::map<std::string, StoredProfile> profiles;
-    if (!readOrLog([&] { return storedProfilesLoad(profiles); })) {
+    if (!FW_RUN_OR_LOG([&] { return storedProfilesLoad(profiles); })) {
         FW_LOG_ERR("Failed to profileEnum()");
         return false;
     }
     for (auto &[name, stored] : profiles) {
         serviceReserve(stored.profile, adapter, servName, policy);
-        if (!storedProfileSave(std::move(stored))) {
+        if (!FW_RUN_OR_LOG([&] { return storedProfileSave(std::move(stored)); })) {
             FW_LOG_ERR("Failed to set profile");
             return false;
         }
     }
-    if (reload && !VELDFW().fwReload(true)) {
+    if (reload && !FW_RUN_OR_LOG([] { return VELDFW().fwReload(true); })) {
         FW_LOG_ERR("Failed to firewall reload");
         return false;
     }
@@ -608,13 +606,13 @@ bool VELDFW_PROFILE::profileAddServToReserve(const std::string &adapter, const s
 
 bool VELDFW_PROFILE::profileRemoveServ(const std::string &servName) {
     std::map<std::string, StoredProfile> profiles;
-    if (!readOrLog([&] { return storedProfilesLoad(profiles); })) {
+    if (!FW_RUN_OR_LOG([&] { return storedProfilesLoad(profiles); })) {
         FW_LOG_ERR("Failed to profileEnum()");
         return false;
     }
     for (auto &[name, stored] : profiles) {
         serviceRemove(stored.profile, servName);
-        if (!storedProfileSave(std::move(stored))) {
+        if (!FW_RUN_OR_LOG([&] { return storedProfileSave(std::move(stored)); })) {
             FW_LOG_ERR("Failed to profile set [%s]", name.c_str());
             return false;
         }
@@ -624,12 +622,12 @@ bool VELDFW_PROFILE::profileRemoveServ(const std::string &servName) {
 
 bool VELDFW_PROFILE::profileChangeAdapter(const std::string &oldAdapter, const std::string &newAdapter, bool reload) {
     std::map<std::string, StoredProfile> profiles;
-    if (!readOrLog([&] { return storedProfilesLoad(profiles); })) {
+    if (!FW_RUN_OR_LOG([&] { return storedProfilesLoad(profiles); })) {
         FW_LOG_ERR("Failed to profileEnum()");
         return false;
     }
     std::string activeProfile;
-    if (!readOrLog([&] { return VELDFW().fwProfileConfigGet(activeProfile); })) {
+    if (!FW_RUN_OR_LOG([&] { return VELDFW().fwProfileConfigGet(activeProfile); })) {
         FW_LOG_ERR("Failed to fwProfileConfigGet()");
         return false;
     }
@@ -638,12 +636,12 @@ bool VELDFW_PROFILE::profileChangeAdapter(const std::string &oldAdapter, const s
         if (adapterRename(stored.profile, oldAdapter, newAdapter) && name == activeProfile) {
             reloadDue = true;
         }
-        if (!storedProfileSave(std::move(stored))) {
+        if (!FW_RUN_OR_LOG([&] { return storedProfileSave(std::move(stored)); })) {
             FW_LOG_ERR("Failed to profile set [%s]", name.c_str());
             return false;
         }
     }
-    if (reloadDue && reload && !VELDFW().fwReload(true)) {
+    if (reloadDue && reload && !FW_RUN_OR_LOG([] { return VELDFW().fwReload(true); })) {
         FW_LOG_ERR("Failed to reload firewall");
         return false;
     }

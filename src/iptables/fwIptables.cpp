@@ -30,7 +30,6 @@ constexpr const char *IGNORED_ADAPTER = "ppp0";     // the PPPoE link's raw name
 constexpr const char *RESERVED_TUNNEL = "tun1000";  // the system's own tunnel, no VPN
 
 constexpr std::array<const char *, 3> PREDEFINED_ADAPTERS = {FW_ADAPTER_GLOBAL, FW_ADAPTER_PPPOE, FW_ADAPTER_VPN};
-constexpr std::array<const char *, 2> FIREWALL_CHAINS = {FW_CHAIN_INPUT, FW_CHAIN_FORWARD};
 
 constexpr const char *LOOPBACK_TEXT = " -i lo -j ACCEPT";
 constexpr const char *ESTABLISHED_TEXT = " -m state --state ESTABLISHED,RELATED -j ACCEPT";
@@ -54,7 +53,7 @@ void preambleAppend(bool keepEstablished, const std::string &clientAddress, Json
     const bool clientIsV6 = !clientAddress.empty() && BlVLIBIsv6IpAddrValid(clientAddress.c_str()) != 0;
     Json::Value &v4 = cmdList["v4"][FW_ADAPTER_GLOBAL];
     Json::Value &v6 = cmdList["v6"][FW_ADAPTER_GLOBAL];
-    for (const char *chain : FIREWALL_CHAINS) {
+    for (const char *chain : FW_CHAINS) {
         const std::string append = std::string("-A ") + chain;
         v4.append(append + LOOPBACK_TEXT);
         if (keepEstablished) {

@@ -17,6 +17,7 @@
 
 #include "utils/log.h"
 #include "utils/platformError.h"
+#include "utils/runOrLog.h"
 #include "veldfirewall/utils.h"
 #include "veldfirewall/veldfirewall_c.h"
 
@@ -219,7 +220,7 @@ int moduleCall(bool (*operation)(const std::string &), const char *servName) {
         FW_LOG_ERR("servName is NULL");
         return -1;
     }
-    return operation(servName) ? 0 : -1;
+    return FW_RUN_OR_LOG([&] { return operation(servName); }) ? 0 : -1;
 }
 
 }  // namespace

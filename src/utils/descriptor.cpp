@@ -22,10 +22,14 @@ bool Descriptor::close() {
     return closing < 0 || ::close(closing) == 0;
 }
 
-bool readAll(int fd, std::string &text) {
+bool readAll(int fd, std::string &text, size_t limit) {
     struct stat status = {};
     if (fstat(fd, &status) == 0 && status.st_size > 0) {
-        text.reserve(text.size() + static_cast<size_t>(status.st_size));
+        if (static_cast<size_t>(status.st_size) > limit) {
+            errno = EFBIG;
+            return false;
+        }
+        text.reserve(static_cast<size_t>(status.st_size));
     }
     std::array<char, READ_SIZE> chunk;
     for (;;) {
@@ -33,9 +37,15 @@ bool readAll(int fd, std::string &text) {
         if (length == 0) {
             return true;
         }
-        if (length > 0) {
-            text.append(chunk.data(), static_cast<size_t>(length));
-        } else if (errno != EINTR) {
+        if (length < 0) {
+            if (errno != EINTR) {
+                return false;
+            }
+            continue;
+        }
+        text.append(chunk.data(), static_cast<size_t>(length));
+        if (text.size() > limit) {
+            errno = EFBIG;
             return false;
         }
     }

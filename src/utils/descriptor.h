@@ -3,6 +3,7 @@
 #ifndef VELDFIREWALL_SRC_DESCRIPTOR_H
 #define VELDFIREWALL_SRC_DESCRIPTOR_H
 
+#include <cstddef>
 #include <string>
 
 namespace FW {
@@ -25,8 +26,12 @@ private:
     int fd;
 };
 
-/// Appends everything up to the end of the file to `text`. @return false with errno
-bool readAll(int fd, std::string &text);
+/// More than any document or program output has; it bounds what a broken file can do to the reader's memory.
+constexpr size_t READ_LIMIT = size_t{256} * 1024 * 1024;
+
+/// Reads everything up to the end of the file into `text`, which is empty before. @return false with errno (EFBIG when
+/// there is more than `limit` bytes)
+bool readAll(int fd, std::string &text, size_t limit = READ_LIMIT);
 /// Writes all of `text`. @return false with errno
 bool writeAll(int fd, const std::string &text);
 

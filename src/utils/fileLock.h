@@ -32,6 +32,7 @@ private:
     std::string path;
     int descriptor = -1;
 
+    bool sharedDirectoryLock(const boost::posix_time::ptime &deadline);
     void open();
     void close();
     bool tryLock();

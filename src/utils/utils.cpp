@@ -38,19 +38,6 @@ constexpr mode_t DATA_FILE_MODE = 0666;
 constexpr size_t LOCKED_PATH_SIZE = 1024;
 constexpr const char *LOCK_EXTENSION = ".lock";
 
-/// In a directory where everybody may create files, a lock file that another user planted is taken away: it could be
-/// held locked for ever.
-void plantedFileRemove(const std::string &path) {
-    struct stat status = {};
-    if (lstat(path.c_str(), &status) != 0) {
-        return;
-    }
-    const bool trusted = S_ISREG(status.st_mode) && (status.st_uid == 0 || status.st_uid == geteuid());
-    if (!trusted) {
-        unlink(path.c_str());
-    }
-}
-
 /// Whether the directory's limit leaves room for the name of the lock file. Anybody's file that happens to lie among
 /// the profiles can fail this; such a file counts as unreadable.
 bool isLockable(const std::string &path) {
@@ -136,10 +123,7 @@ std::string getLockFile(const std::string &path) {
     }
     std::array<char, LOCKED_PATH_SIZE> buffer = {};
     std::snprintf(buffer.data(), buffer.size(), "%s", path.c_str());
-    const std::string lockPath = std::string(directory) + basename(buffer.data()) + LOCK_EXTENSION;
-    if (directory == FALLBACK_LOCK_DIRECTORY) {
-        plantedFileRemove(lockPath);
-    }
+    std::string lockPath = std::string(directory) + basename(buffer.data()) + LOCK_EXTENSION;
     if (access(lockPath.c_str(), F_OK) != 0) {
         Descriptor(open(lockPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW, LOCK_FILE_MODE));
     }

@@ -90,7 +90,7 @@ TEST(StoredQuery, EveryFailureIsToldAndNothingIsThrown) {
          {"veldFW.cpp The value of status in " + path + " is no boolean",
           "veldFW.cpp Failed to check firewall status"}},
         {R"({"status": true, "profile": "odd"})",
-         {"veldFW.cpp The stored configuration cannot be read: Value is not convertible to Int.",
+         {"veldFW.cpp Ended by an exception: Value is not convertible to Int.",
           "veldFW.cpp Failed to profileGet(odd)"}},
     };
     for (Case entry : cases) {
