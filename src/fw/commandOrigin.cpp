@@ -10,6 +10,8 @@ namespace FW {
 
 namespace {
 
+constexpr const char *IGNORED_ADAPTER = "ppp0";  // its rules are not translated; those of "pppoe" look the same
+
 bool isInAnyGroup(const Json::Value &section, const std::string &arguments) {
     for (const Json::Value &group : section) {
         for (const Json::Value &command : group) {
@@ -27,6 +29,9 @@ bool commandOriginFind(const FWPROFILE &profile, const std::string &family, cons
                        CommandOrigin &origin) {
     VELDFW_IPTABLES_RULES translator;
     for (const auto &[adapter, rules] : profile.rules) {
+        if (adapter == IGNORED_ADAPTER) {
+            continue;
+        }
         for (size_t i = 0; i < rules.size(); ++i) {
             const FWRULE &rule = rules[i];
             if (!rule.enable || rule.policy == FW_POLICY_NONE || !translator.adapterIsEnabled(adapter)) {
