@@ -40,17 +40,20 @@ bool realIptables(std::string *reason) {
 bool useIptablesBackend(const std::string &backend) {
     requireSandbox("replace iptables");
     for (const auto &program : programs) {
-        // "/sbin/iptables" + "-nft"; looked up in both places, as merged and unmerged systems have it.
-        std::string found;
-        for (const std::string prefix : {"/usr", ""}) {
-            if (access((prefix + program + "-" + backend).c_str(), X_OK) == 0)
-                found = prefix + program + "-" + backend;
+        for (const std::string part : {"", "-restore", "-save"}) {
+            // "/sbin/iptables" + "-nft" + "-save"; looked up in both places, as merged and unmerged systems have it.
+            const std::string name = program + "-" + backend + part;
+            std::string found;
+            for (const std::string prefix : {"/usr", ""}) {
+                if (access((prefix + name).c_str(), X_OK) == 0)
+                    found = prefix + name;
+            }
+            if (found.empty())
+                return false;
+            unlink((program + part).c_str());
+            if (symlink(found.c_str(), (program + part).c_str()) != 0)
+                return false;
         }
-        if (found.empty())
-            return false;
-        unlink(program.c_str());
-        if (symlink(found.c_str(), program.c_str()) != 0)
-            return false;
     }
     return true;
 }

@@ -10,7 +10,8 @@ namespace veldtest {
 
 /// Whether /sbin/iptables and /sbin/ip6tables work here, that is can list and fill chains. When not, `reason` says why.
 bool realIptables(std::string *reason = nullptr);
-/// Makes /sbin/iptables and /sbin/ip6tables of the sandbox those of a backend, "nft" or "legacy".
+/// Makes /sbin/iptables and /sbin/ip6tables of the sandbox, with their -restore and -save, those of a backend, "nft" or
+/// "legacy".
 /// @return false when the machine does not have it
 bool useIptablesBackend(const std::string &backend);
 /// Creates the chains INPUT_FIREWALL and FORWARD_FIREWALL and the jumps to them, for IPv4 and IPv6, as the system's
