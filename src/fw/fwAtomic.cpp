@@ -35,33 +35,39 @@ public:
         return !refusal;
     }
 
+    /// Keeps what undo() puts back.
+    bool snapshotTake(FwApplyFailure &failure) {
+        const std::string message = tablesSave(snapshot);
+        if (!message.empty()) {
+            failure.family = family;
+            failure.message = message;
+        } else if (savedRulesHoldLineBreak(snapshot)) {
+            failure.family = family;
+            failure.message = "a rule in force holds a line break and could not be put back";
+        }
+        return failure.message.empty();
+    }
+
     /// Lets the program read everything and commit nothing.
     bool tryOut(FwApplyFailure &failure) const { return restore({"--test"}, input.text, failure); }
 
-    bool snapshotTake(FwApplyFailure &failure) {
-        const ProgramRun run = programRun({program + "-save", "--counters", "--table", "filter"}, "");
-        if (!run.succeeded) {
-            failure.family = family;
-            failure.message = program + "-save: " + run.message;
-            return false;
-        }
-        snapshot = restoreInputOfSaved(run.output);
-        return true;
-    }
-
     bool commit(FwApplyFailure &failure) const { return restore({}, input.text, failure); }
 
-    /// Puts back what commit() changed. A failure is only logged: there is nothing left to go back to.
-    void takeBack() const {
-        const std::string removal = restoreInputOfRemoval(input);
-        for (const std::string &text : {snapshot, removal}) {
-            if (text.empty()) {
-                continue;
-            }
-            const ProgramRun run = programRun({program + "-restore", "--noflush", "--counters"}, text);
-            if (!run.succeeded) {
-                FW_LOG_ERR("Failed to put the old rules of %s back: %s", program.c_str(), run.message.c_str());
-            }
+    /// Puts back what commit() changed, all or some of it. A failure is only logged: there is nothing left to go back
+    /// to.
+    void undo() const {
+        std::string now;
+        std::string message = tablesSave(now);
+        if (!message.empty()) {
+            FW_LOG_ERR("Failed to list the rules of %s: %s", program.c_str(), message.c_str());
+        }
+        const std::string text = restoreInputOfUndo(input, snapshot, now);
+        if (text.empty()) {
+            return;
+        }
+        const ProgramRun run = programRun(restoreCommand({"--counters"}), text);
+        if (!run.succeeded) {
+            FW_LOG_ERR("Failed to put the old rules of %s back: %s", program.c_str(), run.message.c_str());
         }
     }
 
@@ -72,38 +78,57 @@ private:
     RestoreInput input;
     std::string snapshot;
 
-    bool restore(const std::vector<std::string> &options, const std::string &text, FwApplyFailure &failure) const {
-        std::vector<std::string> command = {program + "-restore", "--noflush"};
+    std::vector<std::string> restoreCommand(const std::vector<std::string> &options) const {
+        // Without --wait the legacy program waits for another holder of the tables' lock for ever.
+        std::vector<std::string> command = {program + "-restore", "--noflush", "--wait=10"};
         command.insert(command.end(), options.begin(), options.end());
-        const ProgramRun run = programRun(command, text);
+        return command;
+    }
+
+    /// @return why not, or nothing
+    std::string tablesSave(std::string &saved) const {
+        for (const std::string &table : input.tables) {
+            const ProgramRun run = programRun({program + "-save", "--counters", "--table", table}, "");
+            if (!run.succeeded) {
+                return program + "-save: " + run.message;
+            }
+            saved += run.output;
+        }
+        return "";
+    }
+
+    bool restore(const std::vector<std::string> &options, const std::string &text, FwApplyFailure &failure) const {
+        const ProgramRun run = programRun(restoreCommand(options), text);
         if (run.succeeded) {
             return true;
         }
-        const size_t culprit = culpritFind(run.message);
+        const size_t line = restoreFailedLine(run.message);
+        const size_t culprit = culpritFind(line);
         if (culprit != RestoreInput::NO_COMMAND) {
             commandTell(culprit, run.message, failure);
         } else {
             failure.family = family;
-            failure.message = program + "-restore: " + run.message;
+            failure.message = program + "-restore: " + (line > 0 ? input.line(line) + ": " : "") + run.message;
         }
         return false;
     }
 
-    /// The command that the program's message blames, or, where it blames only the end of the input, the first one that
-    /// a network namespace of its own refuses as well.
-    size_t culpritFind(const std::string &message) const {
-        const size_t line = restoreFailedLine(message);
-        if (line > 0 && line <= input.commandOfLine.size() &&
-            input.commandOfLine[line - 1] != RestoreInput::NO_COMMAND) {
+    /// The command of the line that the program blames, or, where it blames only the end of a table, the first command
+    /// that a network namespace of its own refuses as well.
+    size_t culpritFind(size_t line) const {
+        if (line == 0 || line > input.commandOfLine.size()) {
+            return RestoreInput::NO_COMMAND;
+        }
+        if (input.commandOfLine[line - 1] != RestoreInput::NO_COMMAND || input.line(line) != "COMMIT") {
             return input.commandOfLine[line - 1];
         }
         const auto isRefused = [this](size_t lines) {
-            return !programRun({SCRATCH_NETWORK_PROGRAM, "--net", program + "-restore", "--noflush"},
-                               restoreInputOfTrial(input, lines))
-                        .succeeded;
+            std::vector<std::string> command = restoreCommand({});
+            command.insert(command.begin(), {SCRATCH_NETWORK_PROGRAM, "--net"});
+            return !programRun(command, restoreInputOfTrial(input, snapshot, lines)).succeeded;
         };
         size_t accepted = 0;
-        size_t refused = input.commandOfLine.size();
+        size_t refused = line;
         if (isRefused(accepted) || !isRefused(refused)) {
             return RestoreInput::NO_COMMAND;
         }
@@ -124,7 +149,7 @@ private:
 
 /// Both families, up to the commits of both or of none.
 bool allOrNothing(std::vector<FamilyApply> &families, FwApplyFailure &failure) {
-    const auto tryOut = [&](FamilyApply &family) { return family.tryOut(failure) && family.snapshotTake(failure); };
+    const auto tryOut = [&](FamilyApply &family) { return family.snapshotTake(failure) && family.tryOut(failure); };
     if (!std::all_of(families.begin(), families.end(), tryOut)) {
         return false;
     }
@@ -132,8 +157,9 @@ bool allOrNothing(std::vector<FamilyApply> &families, FwApplyFailure &failure) {
         if (families[i].commit(failure)) {
             continue;
         }
-        for (size_t committed = i; committed > 0; --committed) {
-            families[committed - 1].takeBack();
+        // This one too: its tables are committed one by one, and it may have died after a commit.
+        for (size_t changed = i + 1; changed > 0; --changed) {
+            families[changed - 1].undo();
         }
         return false;
     }

@@ -10,20 +10,14 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <chrono>
 #include <csignal>
 #include <cstring>
-#include <thread>
 
 #include "utils/descriptor.h"
 
 namespace FW {
 
 namespace {
-
-constexpr int STATUS_TABLES_IN_USE = 4;
-constexpr std::chrono::seconds TABLES_IN_USE_TIME(10);
-constexpr std::chrono::milliseconds RETRY_PAUSE(50);
 
 /// A file in memory: unlike a pipe it never blocks the program, and a process that the program leaves behind cannot
 /// keep us waiting for its end.
@@ -103,16 +97,9 @@ int runOnce(const std::vector<std::string> &command, const std::string &input, P
 }  // namespace
 
 ProgramRun programRun(const std::vector<std::string> &command, const std::string &input) {
-    const auto deadline = std::chrono::steady_clock::now() + TABLES_IN_USE_TIME;
-    for (;;) {
-        ProgramRun run;
-        const int status = runOnce(command, input, run);
-        if (status != STATUS_TABLES_IN_USE || std::chrono::steady_clock::now() >= deadline) {
-            run.succeeded = status == 0;
-            return run;
-        }
-        std::this_thread::sleep_for(RETRY_PAUSE);
-    }
+    ProgramRun run;
+    run.succeeded = runOnce(command, input, run) == 0;
+    return run;
 }
 
 }  // namespace FW

@@ -15,8 +15,6 @@ struct ProgramRun {
 };
 
 /// Runs a program (absolute path first) without a shell and waits for it. It inherits no descriptors beyond 0 to 2.
-/// While it exits with status 4, with which the xtables programs say that another one holds the tables, it is run again
-/// for up to 10 seconds.
 ProgramRun programRun(const std::vector<std::string> &command, const std::string &input);
 
 }  // namespace FW

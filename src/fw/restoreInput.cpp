@@ -6,6 +6,7 @@
 #include <array>
 #include <cctype>
 #include <cstdlib>
+#include <map>
 #include <string_view>
 
 #include "fw/commandLine.h"
@@ -25,11 +26,11 @@ struct Append {
 
 /// Options with which iptables-restore means something else than iptables, or nothing at all: the table, which belongs
 /// to the section; the family, for which it skips the line silently; the tables' lock and the module loader, which
-/// belong to the program.
-constexpr std::array<std::string_view, 6> FOREIGN_OPTIONS = {"table", "ipv4",          "ipv6",
-                                                             "wait",  "wait-interval", "modprobe"};
-constexpr std::string_view FOREIGN_LETTERS = "t46wWM";
-constexpr std::string_view FLAG_LETTERS = "vnx";  // other letters may follow these in the same argument
+/// belong to the program; and those that end it, successfully, with nothing committed.
+constexpr std::array<std::string_view, 8> FOREIGN_OPTIONS = {"table",         "ipv4",     "ipv6", "wait",
+                                                             "wait-interval", "modprobe", "help", "version"};
+constexpr std::string_view FOREIGN_LETTERS = "t46wWMhV";
+constexpr std::string_view FLAG_LETTERS = "fbvnx";  // other letters may follow these in the same argument
 
 bool isForeignOption(const std::string &argument) {
     if (argument.size() < 2 || argument[0] != '-') {
@@ -93,6 +94,11 @@ void lineAppend(RestoreInput &input, const std::string &line, size_t command = R
     input.commandOfLine.push_back(command);
 }
 
+bool isFirewallChain(const std::string &table, const std::string &chain) {
+    return table == FILTER_TABLE &&
+           std::find(FW_CHAINS.begin(), FW_CHAINS.end(), chain) != FW_CHAINS.end();
+}
+
 void sectionAppend(RestoreInput &input, const std::string &table, const std::vector<Append> &appends) {
     lineAppend(input, "*" + table);
     if (table == FILTER_TABLE) {
@@ -106,18 +112,92 @@ void sectionAppend(RestoreInput &input, const std::string &table, const std::vec
         }
         const std::string rule = argumentsText(append.arguments);
         lineAppend(input, "-A " + rule, append.command);
-        if (table != FILTER_TABLE) {
-            input.foreignRules.push_back(table + " " + rule);
+        if (!isFirewallChain(table, append.arguments[0])) {
+            input.foreignRules.push_back({table, append.arguments[0], rule});
         }
     }
     lineAppend(input, "COMMIT");
+}
+
+/// The lines of what iptables-save prints; a line break in quotes belongs to the line.
+std::vector<std::string> savedLines(const std::string &saved) {
+    std::vector<std::string> lines(1);
+    bool quoted = false;
+    for (size_t i = 0; i < saved.size(); ++i) {
+        if (saved[i] == '\n' && !quoted) {
+            lines.emplace_back();
+            continue;
+        }
+        lines.back() += saved[i];
+        if (quoted && saved[i] == '\\' && i + 1 < saved.size()) {
+            lines.back() += saved[++i];
+        } else if (saved[i] == '"') {
+            quoted = !quoted;
+        }
+    }
+    return lines;
+}
+
+/// Tables and chains as iptables-save prints them.
+struct SavedTables {
+    std::vector<std::string> lines;
+
+    explicit SavedTables(const std::string &saved) : lines(savedLines(saved)) {}
+
+    /// The rules of a chain, without the counters where `withCounters` is false.
+    std::vector<std::string> rules(const std::string &table, const std::string &chain, bool withCounters) const {
+        std::vector<std::string> found;
+        const std::string start = "-A " + chain + " ";
+        ofTable(table, [&](const std::string &line) {
+            // With counters: "[packets:bytes] -A CHAIN ..."
+            const size_t rule = !line.empty() && line[0] == '[' ? line.find(' ') + 1 : 0;
+            if ((line + " ").compare(rule, start.size(), start) == 0) {
+                found.push_back(line.substr(withCounters ? 0 : rule));
+            }
+        });
+        return found;
+    }
+
+private:
+    template <typename Use> void ofTable(const std::string &table, const Use &use) const {
+        bool inTable = false;
+        for (const std::string &line : lines) {
+            if (!line.empty() && line[0] == '*') {
+                inTable = line == "*" + table;
+            } else if (inTable) {
+                use(line);
+            }
+        }
+    }
+};
+
+/// The lines that take the rules of one foreign chain out again.
+std::string foreignUndo(const std::vector<std::string> &ours, const std::string &chain,
+                        const std::vector<std::string> &before, const std::vector<std::string> &now) {
+    std::string text;
+    if (now.size() == before.size()) {
+        return text;
+    }
+    // "-D rule" takes the first of equal rules, which may have stood elsewhere before. By number it is ours for sure
+    // as long as nobody else has changed the chain.
+    if (now.size() == before.size() + ours.size() && std::equal(before.begin(), before.end(), now.begin())) {
+        for (size_t i = 0; i < ours.size(); ++i) {
+            text += "-D " + chain + " " + std::to_string(before.size() + 1) + "\n";
+        }
+        return text;
+    }
+    for (auto rule = ours.rbegin(); rule != ours.rend(); ++rule) {
+        text += "-D " + *rule + "\n";
+    }
+    return text;
 }
 
 }  // namespace
 
 std::optional<RestoreRefusal> restoreInputWrite(const std::vector<ListedCommand> &commands, RestoreInput &input) {
     std::vector<Append> appends;
-    std::vector<std::string> tables = {FILTER_TABLE};
+    std::vector<std::string> &tables = input.tables;
+    tables = {FILTER_TABLE};
     for (size_t i = 0; i < commands.size(); ++i) {
         Append append;
         append.command = i;
@@ -154,70 +234,92 @@ std::string restoreQuoted(const std::string &argument) {
 }
 
 size_t restoreFailedLine(const std::string &printed) {
-    for (size_t at = printed.find("line"); at != std::string::npos; at = printed.find("line", at + 1)) {
-        const size_t digits = printed.find_first_not_of(": ", at + 4);
-        if (digits != std::string::npos && std::isdigit(static_cast<unsigned char>(printed[digits])) != 0) {
-            return std::strtoul(printed.c_str() + digits, nullptr, 10);
+    // At the start of a line only: an argument that the program repeats cannot hold a line break.
+    static constexpr std::array<std::string_view, 2> STARTS = {"Error occurred at line: ", "line "};
+    static constexpr std::string_view FAILED = "-restore: line ";
+    for (const std::string_view start : STARTS) {
+        for (size_t begin = 0; begin < printed.size();) {
+            const size_t end = std::min(printed.find('\n', begin), printed.size());
+            const std::string line = printed.substr(begin, end - begin);
+            begin = end + 1;
+            size_t number = line.compare(0, start.size(), start) == 0 ? start.size() : std::string::npos;
+            const size_t failed = line.find(FAILED);
+            if (number == std::string::npos && failed != std::string::npos && line.find(' ') > failed) {
+                number = failed + FAILED.size();
+            }
+            if (number != std::string::npos) {
+                return std::strtoul(line.c_str() + number, nullptr, 10);
+            }
         }
     }
     return 0;
 }
 
-std::string restoreInputOfSaved(const std::string &saved) {
-    std::string text = std::string("*") + FILTER_TABLE + "\n";
-    for (const char *chain : FW_CHAINS) {
-        text += std::string("-F ") + chain + "\n";
+std::string RestoreInput::line(size_t number) const {
+    size_t begin = 0;
+    for (size_t i = 1; i < number && begin < text.size(); ++i) {
+        begin = text.find('\n', begin) + 1;
     }
-    bool inFilter = false;
-    for (size_t begin = 0; begin < saved.size();) {
-        const size_t end = std::min(saved.find('\n', begin), saved.size());
-        const std::string line = saved.substr(begin, end - begin);
-        begin = end + 1;
-        if (line[0] == '*') {
-            inFilter = line == std::string("*") + FILTER_TABLE;
-        }
-        // With counters: "[packets:bytes] -A CHAIN ..."
-        const size_t rule = line[0] == '[' ? std::min(line.find(' '), line.size() - 1) + 1 : 0;
-        for (const char *chain : FW_CHAINS) {
-            const std::string start = std::string("-A ") + chain + " ";
-            if (inFilter && line.compare(rule, start.size(), start) == 0) {
-                text += line + "\n";
+    return text.substr(begin, text.find('\n', begin) - begin);
+}
+
+bool savedRulesHoldLineBreak(const std::string &saved) {
+    const SavedTables tables(saved);
+    for (const char *chain : FW_CHAINS) {
+        for (const std::string &rule : tables.rules(FILTER_TABLE, chain, false)) {
+            if (rule.find('\n') != std::string::npos) {
+                return true;
             }
         }
     }
-    return text + "COMMIT\n";
+    return false;
 }
 
-std::string restoreInputOfRemoval(const RestoreInput &input) {
+std::string restoreInputOfUndo(const RestoreInput &input, const std::string &before, const std::string &now) {
+    const SavedTables tablesBefore(before);
+    const SavedTables tablesNow(now);
     std::string text;
-    std::string openTable;
-    for (auto rule = input.foreignRules.rbegin(); rule != input.foreignRules.rend(); ++rule) {
-        const size_t blank = rule->find(' ');
-        const std::string table = rule->substr(0, blank);
-        if (table != openTable) {
-            text += openTable.empty() ? "" : "COMMIT\n";
-            text += "*" + table + "\n";
-            openTable = table;
+    for (const std::string &table : input.tables) {
+        std::string section;
+        if (table == FILTER_TABLE) {
+            for (const std::string chain : FW_CHAINS) {
+                if (tablesBefore.rules(table, chain, false) == tablesNow.rules(table, chain, false)) {
+                    continue;
+                }
+                section += "-F " + chain + "\n";
+                for (const std::string &rule : tablesBefore.rules(table, chain, true)) {
+                    section += rule + "\n";
+                }
+            }
         }
-        text += "-D" + rule->substr(blank) + "\n";
+        std::map<std::string, std::vector<std::string>> ours;
+        for (const RestoreInput::ForeignRule &rule : input.foreignRules) {
+            if (rule.table == table) {
+                ours[rule.chain].push_back(rule.line);
+            }
+        }
+        for (const auto &[chain, rules] : ours) {
+            section += foreignUndo(rules, restoreQuoted(chain), tablesBefore.rules(table, chain, false),
+                                   tablesNow.rules(table, chain, false));
+        }
+        if (!section.empty()) {
+            text += "*" + table + "\n" + section + "COMMIT\n";
+        }
     }
-    return openTable.empty() ? text : text + "COMMIT\n";
+    return text;
 }
 
-std::string restoreInputOfTrial(const RestoreInput &input, size_t lines) {
-    std::string text = std::string("*") + FILTER_TABLE + "\n";
-    for (const char *chain : FW_CHAINS) {
-        text += std::string(":") + chain + " - [0:0]\n";
+std::string restoreInputOfTrial(const RestoreInput &input, const std::string &saved, size_t lines) {
+    size_t end = 0;
+    for (size_t line = 0; line < lines && end < input.text.size(); ++line) {
+        end = input.text.find('\n', end) + 1;
     }
-    size_t begin = 0;
-    for (size_t line = 0; line < lines && begin < input.text.size(); ++line) {
-        const size_t end = input.text.find('\n', begin);
-        if (input.commandOfLine[line] != RestoreInput::NO_COMMAND) {
-            text += input.text.substr(begin, end + 1 - begin);
-        }
-        begin = end + 1;
-    }
-    return text + "COMMIT\n";
+    // Without its rules the saved tables would not show from where the firewall chains are reached, on which it depends
+    // whether the kernel accepts some matches.
+    std::string text = saved + input.text.substr(0, end);
+    static const std::string COMMIT = "COMMIT\n";
+    const bool isOpen = end > 0 && input.text.compare(end - std::min(end, COMMIT.size()), COMMIT.size(), COMMIT) != 0;
+    return isOpen ? text + COMMIT : text;
 }
 
 }  // namespace FW
