@@ -23,12 +23,19 @@ using std::chrono::steady_clock;
 
 constexpr milliseconds sendAgainAfter{100};
 
-sockaddr_in addressOf(const std::string &text, uint16_t port) {
-    sockaddr_in address = {};
-    address.sin_family = AF_INET;
-    address.sin_port = htons(port);
-    if (inet_pton(AF_INET, text.c_str(), &address.sin_addr) != 1)
-        throw std::runtime_error("not an IPv4 address: " + text);
+/// Of the family that the text is of.
+sockaddr_in6 addressOf(const std::string &text, uint16_t port) {
+    sockaddr_in6 address = {};  // larger than sockaddr_in
+    auto &v4 = reinterpret_cast<sockaddr_in &>(address);
+    if (inet_pton(AF_INET, text.c_str(), &v4.sin_addr) == 1) {
+        v4.sin_family = AF_INET;
+        v4.sin_port = htons(port);
+    } else if (inet_pton(AF_INET6, text.c_str(), &address.sin6_addr) == 1) {
+        address.sin6_family = AF_INET6;
+        address.sin6_port = htons(port);
+    } else {
+        throw std::runtime_error("not an address: " + text);
+    }
     return address;
 }
 
@@ -38,11 +45,12 @@ void require(bool succeeded, const std::string &what) {
 }
 
 int startProbe(const BatchProbe &probe) {
-    const int handle = socket(AF_INET, (probe.udp ? SOCK_DGRAM : SOCK_STREAM) | SOCK_NONBLOCK | SOCK_CLOEXEC, 0);
+    const sockaddr_in6 source = addressOf(probe.source, probe.sourcePort);
+    const int handle =
+        socket(source.sin6_family, (probe.udp ? SOCK_DGRAM : SOCK_STREAM) | SOCK_NONBLOCK | SOCK_CLOEXEC, 0);
     require(handle >= 0, "socket");
-    const sockaddr_in source = addressOf(probe.source, probe.sourcePort);
     require(bind(handle, reinterpret_cast<const sockaddr *>(&source), sizeof(source)) == 0, "bind to " + probe.source);
-    const sockaddr_in target = addressOf(probe.address, probe.port);
+    const sockaddr_in6 target = addressOf(probe.address, probe.port);
     const int result = connect(handle, reinterpret_cast<const sockaddr *>(&target), sizeof(target));
     require(result == 0 || errno == EINPROGRESS || errno == ECONNREFUSED, "connect to " + probe.address);
     return handle;

@@ -12,7 +12,7 @@
 
 namespace veldtest {
 
-/// One packet's way: IPv4, numeric.
+/// One packet's way: IPv4 or IPv6, numeric.
 struct BatchProbe {
     bool udp = false;
     std::string source;
