@@ -16,13 +16,13 @@ namespace {
 
 const std::string setAside = ".before-recording";
 
-/// Cuts at NUL; the last field is followed by one, too.
-std::vector<std::string> fieldsOf(const std::string &text) {
-    std::vector<std::string> fields;
+/// The parts of a text of which each is followed by `end`.
+std::vector<std::string> cutAt(char end, const std::string &text) {
+    std::vector<std::string> parts;
     std::istringstream in(text);
-    for (std::string field; std::getline(in, field, '\0');)
-        fields.push_back(field);
-    return fields;
+    for (std::string part; std::getline(in, part, end);)
+        parts.push_back(part);
+    return parts;
 }
 
 }  // namespace
@@ -76,20 +76,12 @@ void CommandRecorder::setDelay(unsigned milliseconds) {
 
 std::vector<RecordedCommand> CommandRecorder::commands() const {
     std::vector<RecordedCommand> result;
-    const auto fields = fieldsOf(readFile(RECORDER_RECORD));
-    for (size_t i = 0; i < fields.size();) {
-        // word count, handle count, words, handles
-        const size_t words = std::stoul(fields.at(i));
-        const size_t handles = std::stoul(fields.at(i + 1));
-        i += 2;
-        RecordedCommand command;
-        command.program = fields.at(i);
-        for (size_t word = 1; word < words; ++word)
-            command.arguments.push_back(fields.at(i + word));
-        i += words;
-        for (size_t handle = 0; handle < handles; ++handle)
-            command.inheritedHandles.push_back(std::stoi(fields.at(i + handle)));
-        i += handles;
+    for (const auto &run : cutAt(END_OF_RUN, readFile(RECORDER_RECORD))) {
+        const auto fields = cutAt('\0', run);
+        RecordedCommand command{fields.at(1), {fields.begin() + 2, fields.end()}, {}};
+        std::istringstream handles(fields[0]);
+        for (int handle = -1; handles >> handle;)
+            command.inheritedHandles.push_back(handle);
         result.push_back(command);
     }
     return result;

@@ -3,6 +3,7 @@
 #ifndef VELD_TEST_CONNECTIONS_H
 #define VELD_TEST_CONNECTIONS_H
 
+#include "handle.h"
 #include "network.h"
 
 #include <sys/types.h>
@@ -39,22 +40,18 @@ constexpr std::chrono::milliseconds probeTimeout{700};
 ProbeResult probeTcp(const ProbeTarget &target, const NetworkNamespace *space = nullptr,
                      std::chrono::milliseconds timeout = probeTimeout);
 /// Sends a datagram (three times within the time) and waits for its echo.
-ProbeResult probeUdp(const ProbeTarget &target, const NetworkNamespace *space = nullptr,
-                     std::chrono::milliseconds timeout = probeTimeout);
+ProbeResult probeUdp(const ProbeTarget &target, const NetworkNamespace *space = nullptr);
 
 /// A TCP connection that lasts as long as the object. Throws std::runtime_error when it cannot be made.
 class Connection {
 public:
     explicit Connection(const ProbeTarget &target, const NetworkNamespace *space = nullptr);
-    ~Connection();
-    Connection(const Connection &) = delete;
-    Connection &operator=(const Connection &) = delete;
 
     /// Sends a line and waits for its echo: connected when it came, timedOut when not.
     ProbeResult exchange(std::chrono::milliseconds timeout = probeTimeout);
 
 private:
-    int m_socket = -1;
+    Handle m_socket;
     unsigned m_count = 0;
 };
 
@@ -68,8 +65,6 @@ public:
     ~EchoServer();
     EchoServer(const EchoServer &) = delete;
     EchoServer &operator=(const EchoServer &) = delete;
-
-    pid_t pid() const { return m_process; }
 
 private:
     pid_t m_process = -1;

@@ -2,49 +2,28 @@
 // Files in the sandbox.
 #include "files.h"
 
+#include "handle.h"
 #include "sandbox.h"
 
-#include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
-#include <system_error>
 
 namespace fs = std::filesystem;
 
 namespace veldtest {
-namespace {
-
-std::system_error systemError(const std::string &what) {
-    return std::system_error(errno, std::generic_category(), what);
-}
-
-}  // namespace
-
 void writeFile(const std::string &path, const std::string &text, mode_t mode) {
     requireSandbox("write " + path);
     makeDirectories(fs::path(path).parent_path().string());
     unlink(path.c_str());
-    const int file = open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, mode);
-    if (file < 0)
-        throw systemError("create " + path);
-    size_t done = 0;
-    while (done < text.size()) {
-        const ssize_t count = write(file, text.data() + done, text.size() - done);
-        if (count < 0) {
-            const int error = errno;
-            close(file);
-            throw std::system_error(error, std::generic_category(), "write " + path);
-        }
-        done += static_cast<size_t>(count);
-    }
-    fchmod(file, mode);
-    close(file);
+    std::ofstream out(path, std::ios::binary);
+    out << text << std::flush;
+    if (!out || chmod(path.c_str(), mode) != 0)
+        throw systemError("write " + path);
 }
 
 std::string readFile(const std::string &path) {

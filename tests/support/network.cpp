@@ -3,6 +3,8 @@
 #include "network.h"
 
 #include "files.h"
+#include "handle.h"
+#include "processes.h"
 #include "sandbox.h"
 
 #include <fcntl.h>
@@ -10,20 +12,13 @@
 #include <sys/mount.h>
 #include <unistd.h>
 
-#include <cerrno>
 #include <exception>
-#include <stdexcept>
-#include <system_error>
 #include <thread>
 
 namespace veldtest {
 namespace {
 
 const std::string namedSpaces = "/run/netns/";  // where ip(8) looks for names
-
-std::system_error systemError(const std::string &what) {
-    return std::system_error(errno, std::generic_category(), what);
-}
 
 /// Runs a function on a thread of its own, because a namespace belongs to a thread, and passes its exception on.
 void onOwnThread(const std::function<void()> &function) {
@@ -40,14 +35,6 @@ void onOwnThread(const std::function<void()> &function) {
         std::rethrow_exception(failure);
 }
 
-std::vector<std::string> ipCommand(const NetworkNamespace *space, const std::vector<std::string> &arguments) {
-    std::vector<std::string> command;
-    if (space != nullptr)
-        command = {"-n", space->name()};
-    command.insert(command.end(), arguments.begin(), arguments.end());
-    return command;
-}
-
 }  // namespace
 
 NetworkNamespace::NetworkNamespace(std::string name) : m_name(std::move(name)) {
@@ -55,13 +42,11 @@ NetworkNamespace::NetworkNamespace(std::string name) : m_name(std::move(name)) {
     onOwnThread([this] {
         if (unshare(CLONE_NEWNET) != 0)
             throw systemError("unshare the network");
-        m_handle = open("/proc/thread-self/ns/net", O_RDONLY | O_CLOEXEC);
-        if (m_handle < 0)
-            throw systemError("open /proc/thread-self/ns/net");
+        m_handle = {open("/proc/thread-self/ns/net", O_RDONLY | O_CLOEXEC), "open /proc/thread-self/ns/net"};
     });
     const std::string file = namedSpaces + m_name;
     writeFile(file, "");
-    const std::string source = "/proc/self/fd/" + std::to_string(m_handle);
+    const std::string source = "/proc/self/fd/" + std::to_string(m_handle.get());
     if (mount(source.c_str(), file.c_str(), nullptr, MS_BIND, nullptr) != 0)
         throw systemError("bind the network namespace to " + file);
     setUp("lo", this);
@@ -71,26 +56,21 @@ NetworkNamespace::~NetworkNamespace() {
     const std::string file = namedSpaces + m_name;
     umount2(file.c_str(), MNT_DETACH);
     unlink(file.c_str());
-    close(m_handle);
 }
 
 void NetworkNamespace::run(const std::function<void()> &function) const {
     onOwnThread([&] {
-        if (setns(m_handle, CLONE_NEWNET) != 0)
+        if (setns(m_handle.get(), CLONE_NEWNET) != 0)
             throw systemError("enter network namespace " + m_name);
         function();
     });
 }
 
-ProgramResult NetworkNamespace::runProgram(const std::vector<std::string> &command) const {
-    ProgramResult result;
-    run([&] { result = veldtest::runProgram(command); });
-    return result;
-}
-
-void ip(const std::vector<std::string> &arguments) {
+void ip(const std::vector<std::string> &arguments, const NetworkNamespace *space) {
     requireSandbox("change network interfaces");
     std::vector<std::string> command = {"ip"};
+    if (space != nullptr)
+        command = {"ip", "-n", space->name()};
     command.insert(command.end(), arguments.begin(), arguments.end());
     runChecked(command);
 }
@@ -99,11 +79,6 @@ void addDummyInterface(const std::string &name) {
     requireSandbox("add interface " + name);
     if (!runProgram({"ip", "link", "add", name, "type", "dummy"}).succeeded())
         ip({"link", "add", name, "type", "bridge"});
-}
-
-bool addTunInterface(const std::string &name) {
-    requireSandbox("add interface " + name);
-    return runProgram({"ip", "tuntap", "add", "mode", "tun", "name", name}).succeeded();
 }
 
 void addVethPair(const std::string &name, const std::string &peer) {
@@ -123,15 +98,11 @@ void addAddress(const std::string &interface, const std::string &address, const 
     // Without the search for duplicates, during which an IPv6 address cannot be used.
     if (address.find(':') != std::string::npos)
         arguments.emplace_back("nodad");
-    ip(ipCommand(space, arguments));
+    ip(arguments, space);
 }
 
 void setUp(const std::string &interface, const NetworkNamespace *space) {
-    ip(ipCommand(space, {"link", "set", interface, "up"}));
-}
-
-void setDown(const std::string &interface, const NetworkNamespace *space) {
-    ip(ipCommand(space, {"link", "set", interface, "down"}));
+    ip({"link", "set", interface, "up"}, space);
 }
 
 }  // namespace veldtest

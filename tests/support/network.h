@@ -3,6 +3,7 @@
 #ifndef VELD_TEST_NETWORK_H
 #define VELD_TEST_NETWORK_H
 
+#include "handle.h"
 #include "processes.h"
 
 #include <functional>
@@ -24,22 +25,19 @@ public:
     /// Runs a function inside, on a thread of its own. Sockets that it opens belong to this namespace and stay usable
     /// afterwards. An exception is passed on.
     void run(const std::function<void()> &function) const;
-    /// Runs a program inside.
-    ProgramResult runProgram(const std::vector<std::string> &command) const;
 
 private:
     std::string m_name;
-    int m_handle = -1;
+    Handle m_handle;
 };
 
-/// Runs ip(8) with these arguments; throws std::runtime_error with what it printed when it fails.
-void ip(const std::vector<std::string> &arguments);
+/// Runs ip(8) with these arguments, in `space` or the sandbox's own; throws std::runtime_error with what it printed
+/// when it fails.
+void ip(const std::vector<std::string> &arguments, const NetworkNamespace *space = nullptr);
 
 /// Adds an interface that leads nowhere: of type dummy, or a bridge without ports where the kernel has no dummy. Down
 /// and without address.
 void addDummyInterface(const std::string &name);
-/// Adds a tun interface. @return false when the machine has no usable /dev/net/tun
-bool addTunInterface(const std::string &name);
 /// Adds a pair of connected interfaces, both in the sandbox's own namespace, down.
 void addVethPair(const std::string &name, const std::string &peer);
 /// Adds a pair, the peer in `other`.
@@ -50,8 +48,6 @@ void removeInterface(const std::string &name);
 void addAddress(const std::string &interface, const std::string &address, const NetworkNamespace *space = nullptr);
 /// Switches an interface on.
 void setUp(const std::string &interface, const NetworkNamespace *space = nullptr);
-/// Switches an interface off.
-void setDown(const std::string &interface, const NetworkNamespace *space = nullptr);
 
 }  // namespace veldtest
 

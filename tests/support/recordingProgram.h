@@ -4,8 +4,10 @@
 #define VELD_TEST_RECORDING_PROGRAM_H
 
 #define RECORDER_DIRECTORY "/run/command-recorder"
-/* Per run, each field followed by NUL: word count, handle count, words (argv), open descriptors above 2. */
+/* Per run: open descriptors above 2 joined by blanks, then the words (argv), each of them followed by NUL; at the end
+ * END_OF_RUN. */
 #define RECORDER_RECORD RECORDER_DIRECTORY "/record"
+#define END_OF_RUN '\036'
 /* Per rule, each field followed by NUL: "at" | "matching" | "delay", its value, exit status, text for stderr. */
 #define RECORDER_RULES RECORDER_DIRECTORY "/rules"
 

@@ -2,34 +2,27 @@
 // Namespaces and processes of a sandbox.
 #include "sandbox.h"
 
+#include "handle.h"
+#include "processes.h"
 #include "sandboxRoot.h"
 
 #include <linux/close_range.h>
-#include <net/if.h>
 #include <sched.h>
-#include <sys/ioctl.h>
 #include <sys/prctl.h>
-#include <sys/socket.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <cstring>
 #include <fstream>
 #include <stdexcept>
-#include <system_error>
 
 namespace veldtest {
 namespace {
 
 bool entered = false;
 SandboxInfo info;
-
-std::system_error systemError(const std::string &what) {
-    return std::system_error(errno, std::generic_category(), what);
-}
 
 void writeIdMap(const std::string &file, const std::string &text) {
     std::ofstream out(file);
@@ -52,32 +45,6 @@ void unshareNamespaces() {
     info.userNamespace = true;
 }
 
-void raiseLoopback() {
-    const int handle = socket(AF_INET, SOCK_DGRAM | SOCK_CLOEXEC, 0);
-    ifreq request = {};
-    std::strcpy(request.ifr_name, "lo");
-    request.ifr_flags = IFF_UP | IFF_RUNNING;
-    const int result = ioctl(handle, SIOCSIFFLAGS, &request);
-    const int error = errno;
-    close(handle);
-    errno = error;
-    if (result != 0)
-        throw systemError("raise the loopback interface");
-}
-
-int exitCode(int status) {
-    return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-}
-
-int waitFor(pid_t child) {
-    int status = 0;
-    while (waitpid(child, &status, 0) < 0) {
-        if (errno != EINTR)
-            throw systemError("wait for the sandbox");
-    }
-    return status;
-}
-
 /// Process 1 of the sandbox: collects orphans until `main` has ended. When it exits, the kernel ends all the others.
 [[noreturn]] void reapUntil(pid_t main) {
     for (;;) {
@@ -86,7 +53,7 @@ int waitFor(pid_t child) {
         if (ended == main) {
             if (WIFSIGNALED(status))
                 std::fprintf(stderr, "ended by signal %d (%s)\n", WTERMSIG(status), strsignal(WTERMSIG(status)));
-            _exit(exitCode(status));
+            _exit(WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status));
         }
         if (ended < 0 && errno != EINTR)
             _exit(127);
@@ -107,7 +74,7 @@ int runInSandbox(const std::function<int()> &body, const std::function<int(const
     // The outermost process stays outside, so that a sandbox that cannot be finished leaves no half-changed process.
     const pid_t builder = forkOrThrow();
     if (builder != 0)
-        return exitCode(waitFor(builder));
+        return waitForChild(builder);
     prctl(PR_SET_PDEATHSIG, SIGKILL);
     // What our starter left open is not to reach the programs that tests start.
     close_range(STDERR_FILENO + 1, ~0U, CLOSE_RANGE_CLOEXEC);
@@ -116,10 +83,10 @@ int runInSandbox(const std::function<int()> &body, const std::function<int(const
         unshareNamespaces();
         const pid_t first = forkOrThrow();
         if (first != 0)
-            _exit(exitCode(waitFor(first)));
+            _exit(waitForChild(first));
         prctl(PR_SET_PDEATHSIG, SIGKILL);
         info.overlay = enterPrivateRoot(!info.userNamespace);
-        raiseLoopback();
+        runChecked({"ip", "link", "set", "lo", "up"});
         entered = true;
         const pid_t main = forkOrThrow();
         if (main != 0)

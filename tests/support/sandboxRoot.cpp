@@ -2,18 +2,22 @@
 // Builds the file system that a sandbox sees: an overlay over "/", or a tmpfs of links where overlays are not allowed.
 #include "sandboxRoot.h"
 
+#include "handle.h"
+
 #include <fcntl.h>
+#include <mntent.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <cerrno>
-#include <cstring>
+#include <cstdio>
 #include <filesystem>
 #include <fstream>
-#include <sstream>
+#include <map>
+#include <memory>
+#include <set>
 #include <string>
 #include <system_error>
 #include <utility>
@@ -38,10 +42,6 @@ const std::vector<std::string> kernelDirectories = {"/proc", "/sys"};
 const std::vector<std::string> linkedDirectories = {
     "/",    "/usr",     "/usr/bin",          "/usr/sbin", "/usr/lib", "/usr/share", "/usr/lib/modules", "/etc",
     "/var", "/var/lib", "/etc/alternatives", "/bin",      "/sbin",    "/lib",       "/lib/modules"};
-
-std::system_error systemError(const std::string &what) {
-    return std::system_error(errno, std::generic_category(), what);
-}
 
 bool mounted(const std::string &source, const std::string &target, const char *type, unsigned long flags,
              const std::string &options = "") {
@@ -70,32 +70,12 @@ bool isBelowAny(const std::string &path, const std::vector<std::string> &directo
     return std::any_of(directories.begin(), directories.end(), [&](const auto &d) { return isBelow(path, d); });
 }
 
-/// Undoes the octal escapes of /proc/self/mountinfo.
-std::string unescapeMountPoint(const std::string &text) {
-    std::string result;
-    for (size_t i = 0; i < text.size(); ++i) {
-        if (text[i] == '\\' && i + 3 < text.size()) {
-            result += static_cast<char>(std::stoi(text.substr(i + 1, 3), nullptr, 8));
-            i += 3;
-        } else {
-            result += text[i];
-        }
-    }
-    return result;
-}
-
 /// Mount points below "/" that have no other mount point above them.
 std::vector<std::string> outermostMountPoints() {
-    std::vector<std::string> points;
-    std::ifstream in("/proc/self/mountinfo");
-    for (std::string line; std::getline(in, line);) {
-        std::istringstream fields(line);
-        std::string field;
-        for (int i = 0; i < 5; ++i)
-            fields >> field;
-        points.push_back(unescapeMountPoint(field));
-    }
-    std::sort(points.begin(), points.end());
+    std::set<std::string> points;  // sorted: what lies above comes first
+    std::unique_ptr<FILE, int (*)(FILE *)> mounts(setmntent("/proc/self/mounts", "re"), endmntent);
+    while (const auto *entry = mounts ? getmntent(mounts.get()) : nullptr)
+        points.insert(entry->mnt_dir);
     std::vector<std::string> outermost;
     for (const auto &point : points) {
         if (point != "/" && !isBelowAny(point, outermost))
@@ -104,37 +84,26 @@ std::vector<std::string> outermostMountPoints() {
     return outermost;
 }
 
-/// A directory that must stay visible although its parent is emptied, held open because it will be hidden on the way.
-struct KeptDirectory {
-    std::string path;
-    int handle;
-};
-
-/// The entries of fresh directories that lead to the program, the working directory and the build.
-std::vector<KeptDirectory> openKeptDirectories() {
+/// The entries of fresh directories that lead to the program, the working directory and the build: they must stay
+/// visible, and are held open because they will be hidden on the way.
+std::map<std::string, Handle> openKeptDirectories() {
     std::error_code ignored;
-    const std::vector<std::string> wanted = {fs::read_symlink("/proc/self/exe", ignored).string(),
-                                             fs::current_path(ignored).string(), VELD_SOURCE_DIR, VELD_BINARY_DIR};
-    std::vector<KeptDirectory> kept;
-    for (const auto &path : wanted) {
+    std::map<std::string, Handle> kept;
+    for (const auto &path : {fs::read_symlink("/proc/self/exe", ignored).string(), fs::current_path(ignored).string(),
+                             std::string(VELD_SOURCE_DIR), std::string(VELD_BINARY_DIR)}) {
         for (const auto &fresh : freshDirectories) {
-            if (!isBelow(path, fresh) || path == fresh)
-                continue;
             const std::string entry = path.substr(0, path.find('/', fresh.size() + 1));
-            const bool known = std::any_of(kept.begin(), kept.end(), [&](const auto &k) { return k.path == entry; });
-            const int handle = known ? -1 : open(entry.c_str(), O_PATH | O_CLOEXEC | O_DIRECTORY);
-            if (handle >= 0)
-                kept.push_back({entry, handle});
+            if (isBelow(path, fresh) && path != fresh && fs::is_directory(entry))
+                kept[entry] = {open(entry.c_str(), O_PATH | O_CLOEXEC | O_DIRECTORY), "open " + entry};
         }
     }
     return kept;
 }
 
-void putBackKeptDirectories(const std::vector<KeptDirectory> &kept) {
-    for (const auto &directory : kept) {
-        fs::create_directories(newRoot + directory.path);
-        bindOrThrow("/proc/self/fd/" + std::to_string(directory.handle), newRoot + directory.path);
-        close(directory.handle);
+void putBackKeptDirectories(const std::map<std::string, Handle> &kept) {
+    for (const auto &[path, handle] : kept) {
+        fs::create_directories(newRoot + path);
+        bindOrThrow("/proc/self/fd/" + std::to_string(handle.get()), newRoot + path);
     }
 }
 
@@ -203,6 +172,11 @@ void mountLinkedRoot() {
     linkDirectory("/");
 }
 
+void makePublicDirectory(const std::string &path) {
+    fs::create_directories(path);
+    fs::permissions(path, fs::perms::all | fs::perms::sticky_bit);
+}
+
 void makeDevices() {
     const std::string dev = newRoot + "/dev";
     for (const char *name : {"null", "zero", "full", "random", "urandom", "tty", "net/tun"}) {
@@ -214,16 +188,16 @@ void makeDevices() {
         const std::ofstream created(target);
         mountOrThrow(source, target, nullptr, MS_BIND);
     }
-    fs::create_symlink("/proc/self/fd", dev + "/fd");
-    fs::create_symlink("/proc/self/fd/0", dev + "/stdin");
-    fs::create_symlink("/proc/self/fd/1", dev + "/stdout");
-    fs::create_symlink("/proc/self/fd/2", dev + "/stderr");
-    fs::create_symlink("pts/ptmx", dev + "/ptmx");
+    for (const auto &[name, target] : {std::pair{"fd", "/proc/self/fd"},
+                                       {"stdin", "/proc/self/fd/0"},
+                                       {"stdout", "/proc/self/fd/1"},
+                                       {"stderr", "/proc/self/fd/2"},
+                                       {"ptmx", "pts/ptmx"}})
+        fs::create_symlink(target, dev + "/" + name);
     fs::create_directory(dev + "/pts");
     if (!mounted("devpts", dev + "/pts", "devpts", 0, "newinstance,ptmxmode=0666,mode=0620"))
         bindOrThrow("/dev/pts", dev + "/pts");
-    fs::create_directory(dev + "/shm");
-    chmod((dev + "/shm").c_str(), 01777);
+    makePublicDirectory(dev + "/shm");
 }
 
 void mountFreshDirectories() {
@@ -232,9 +206,7 @@ void mountFreshDirectories() {
         fs::create_directories(target);
         mountOrThrow("tmpfs", target, "tmpfs", 0, directory == "/tmp" ? "mode=1777" : "mode=755");
     }
-    const std::string locks = newRoot + "/run/lock";
-    fs::create_directory(locks);
-    chmod(locks.c_str(), 01777);
+    makePublicDirectory(newRoot + "/run/lock");
     // Usually a link to /run/lock, and then fresh already.
     const std::string oldLocks = newRoot + "/var/lock";
     if (!fs::is_symlink(oldLocks)) {

@@ -10,8 +10,6 @@
 #include "systemLog.h"
 
 #include <gtest/gtest.h>
-#include <net/if.h>
-#include <sys/socket.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -32,29 +30,17 @@ TEST(Sandbox, AnyPathCanBeCreatedOrReplaced) {
     }
 }
 
-TEST(Sandbox, FreshDirectoriesStartEmptyAndDevicesWork) {
-    EXPECT_TRUE(listDirectory("/usr/veld").empty());
-    EXPECT_TRUE(listDirectory("/var/lock").empty());
-    EXPECT_EQ(listDirectory("/run"), std::vector<std::string>{"lock"});
+TEST(Sandbox, WhatBelongsToTheMachineIsHidden) {
+    for (const char *directory : {"/usr/veld", "/var/lock", "/sys/module", "/lib/modules"})
+        EXPECT_TRUE(listDirectory(directory).empty()) << directory;
     EXPECT_FALSE(pathExists("/dev/log"));
     EXPECT_EQ(runProgram({"dd", "if=/dev/zero", "of=/dev/full", "count=1"}).status, 1);
-    EXPECT_EQ(runProgram({"dd", "if=/dev/urandom", "of=/dev/null", "count=1"}).status, 0);
-}
-
-TEST(Sandbox, OnlyLoopbackExistsAndIsUp) {
-    auto *interfaces = if_nameindex();
-    ASSERT_NE(interfaces, nullptr);
-    std::vector<std::string> names;
-    for (auto *entry = interfaces; entry->if_index != 0; ++entry)
-        names.emplace_back(entry->if_name);
-    if_freenameindex(interfaces);
-    EXPECT_EQ(names, std::vector<std::string>{"lo"});
-    EXPECT_EQ(probeTcp({"127.0.0.1", 9}), ProbeResult::refused);
-    EXPECT_EQ(probeTcp({"::1", 9}), ProbeResult::refused);
+    const auto links = runChecked({"ip", "-br", "link", "show"});
+    EXPECT_EQ(links.substr(0, 3), "lo ");
+    EXPECT_EQ(links.find('\n'), links.size() - 1) << links;
 }
 
 TEST(Processes, ResultsOfChildrenAndProgramsAreSeen) {
-    EXPECT_EQ(runInChild([] { return 7; }), 7);
     EXPECT_EQ(runInChild([] { return raise(SIGKILL); }), 128 + SIGKILL);
     const auto result = runProgram({"sh", "-c", "echo out; echo err >&2; exit 3"});
     EXPECT_EQ(result.status, 3);
@@ -63,69 +49,49 @@ TEST(Processes, ResultsOfChildrenAndProgramsAreSeen) {
     EXPECT_THROW(runProgram({"/no/such/program"}), std::exception);
 }
 
-TEST(SystemLog, MessagesArriveWithPriorityInOrderEvenInLargeNumbers) {
-    SystemLog log;
-    openlog("tester", LOG_PID, LOG_DAEMON);
-    for (int i = 0; i < 2000; ++i)
-        syslog(LOG_ERR, "veldFW.cpp:%d message", i);
-    EXPECT_EQ(runInChild([] {
-                  syslog(LOG_DEBUG, "from: a child");
-                  return 0;
-              }),
-              0);
-    const auto messages = log.messages();
-    ASSERT_EQ(messages.size(), 2001u);
-    EXPECT_EQ(messages[1999].text, "veldFW.cpp:1999 message");
-    EXPECT_EQ(messages[1999].priority, LOG_ERR);
-    EXPECT_EQ(messages[1999].ident, "tester");
-    EXPECT_EQ(messages[2000].text, "from: a child");
-    EXPECT_EQ(messages[2000].priority, LOG_DEBUG);
-    EXPECT_FALSE(log.contains("no such text"));
-    log.clear();
-    EXPECT_TRUE(log.messages().empty());
-}
-
-TEST(SystemLog, ASecondOneReceivesAfterTheFirstHasGone) {
-    {
-        SystemLog first;
-        syslog(LOG_INFO, "one");
+TEST(SystemLog, MessagesArriveInOrderEvenInLargeNumbersAndAtASecondLog) {
+    for (int turn = 0; turn < 2; ++turn) {
+        SystemLog log;
+        openlog("tester", LOG_PID, LOG_DAEMON);
+        for (int i = 0; i < 2000; ++i)
+            syslog(LOG_ERR, "veldFW.cpp:%d message", i);
+        runInChild([] {
+            syslog(LOG_DEBUG, "from: a child");
+            return 0;
+        });
+        const auto messages = log.messages();
+        ASSERT_EQ(messages.size(), 2001u);
+        EXPECT_EQ(messages[1999].text, "veldFW.cpp:1999 message");
+        EXPECT_EQ(messages[1999].priority, LOG_ERR);
+        EXPECT_EQ(messages[2000].text, "from: a child");
+        EXPECT_EQ(messages[2000].priority, LOG_DEBUG);
     }
-    SystemLog second;
-    syslog(LOG_INFO, "two");
-    EXPECT_EQ(second.messages().size(), 1u) << second.text();
 }
 
-TEST(CommandRecorder, ArgumentsAreKeptApartAndFailuresHappenAsTold) {
-    CommandRecorder recorder;
-    EXPECT_EQ(runProgram({"/sbin/iptables", "-A", "two words", "", "x\ny"}).status, 0);
-    recorder.failAt(3, 4, "locked");
-    recorder.failMatching("-j BAD", 2, "Bad argument");
-    EXPECT_EQ(runProgram({"/sbin/ip6tables", "-F"}).status, 0);
-    const auto third = runProgram({"/sbin/iptables", "-F"});
-    EXPECT_EQ(third.status, 4);
-    EXPECT_EQ(third.errors, "locked\n");
-    EXPECT_EQ(runProgram({"/sbin/iptables", "-A", "X", "-j", "BAD"}).errors, "Bad argument\n");
-    const auto commands = recorder.commands();
-    ASSERT_EQ(commands.size(), 4u);
-    EXPECT_EQ(commands[0].program, "/sbin/iptables");
-    EXPECT_EQ(commands[0].arguments, (std::vector<std::string>{"-A", "two words", "", "x\ny"}));
-    EXPECT_TRUE(commands[0].inheritedHandles.empty());
-    EXPECT_EQ(commands[3].line(), "/sbin/iptables -A X -j BAD");
-    recorder.clear();
-    EXPECT_EQ(runProgram({"/sbin/iptables", "-A", "X", "-j", "BAD"}).status, 0);
-    EXPECT_EQ(recorder.lines().size(), 1u);
-}
-
-TEST(CommandRecorder, InheritedDescriptorsAreNoticedAndTheOldProgramComesBack) {
-    const bool existed = pathExists("/sbin/iptables");
+TEST(CommandRecorder, RunsAreToldApartAndFailAsTold) {
     {
         CommandRecorder recorder;
         const int leaked = dup(1);  // without close-on-exec
-        runProgram({"/sbin/iptables"});
+        runProgram({"/sbin/iptables", "-A", "two words", "", "x\ny"});
         close(leaked);
-        EXPECT_EQ(recorder.commands().at(0).inheritedHandles, std::vector<int>{leaked});
+        recorder.failAt(2, 4, "locked");
+        recorder.failMatching("-j BAD", 2, "Bad argument");
+        const auto second = runProgram({"/sbin/ip6tables", "-F"});
+        EXPECT_EQ(second.status, 4);
+        EXPECT_EQ(second.errors, "locked\n");
+        EXPECT_EQ(runProgram({"/sbin/iptables", "-F"}).status, 0);
+        EXPECT_EQ(runProgram({"/sbin/iptables", "-A", "X", "-j", "BAD"}).errors, "Bad argument\n");
+        const auto commands = recorder.commands();
+        ASSERT_EQ(commands.size(), 4u);
+        EXPECT_EQ(commands[0].arguments, (std::vector<std::string>{"-A", "two words", "", "x\ny"}));
+        EXPECT_EQ(commands[0].inheritedHandles, std::vector<int>{leaked});
+        EXPECT_TRUE(commands[1].inheritedHandles.empty());
+        EXPECT_EQ(commands[3].line(), "/sbin/iptables -A X -j BAD");
+        recorder.clear();
+        EXPECT_EQ(runProgram({"/sbin/iptables", "-A", "X", "-j", "BAD"}).status, 0);
+        EXPECT_EQ(recorder.lines().size(), 1u);
     }
-    EXPECT_EQ(pathExists("/sbin/iptables"), existed);
+    EXPECT_EQ(runProgram({"/sbin/iptables", "--version"}).output.substr(0, 8), "iptables");
 }
 
 class TwoNetworks : public testing::TestWithParam<const char *> {
@@ -172,26 +138,5 @@ TEST_P(TwoNetworks, RealRulesDecideWhatAClientReaches) {
 
 INSTANTIATE_TEST_SUITE_P(Backends, TwoNetworks, testing::Values("nft", "legacy"),
                          [](const auto &entry) { return std::string(entry.param); });
-
-TEST(Network, InterfacesAppearWithTheGivenNames) {
-    addDummyInterface("lan7");
-    addAddress("lan7", "192.168.7.1/24");
-    addAddress("lan7", "fd07::1/64");
-    setUp("lan7");
-    EXPECT_NE(if_nametoindex("lan7"), 0u);
-    EXPECT_EQ(probeTcp({"192.168.7.1", 9}), ProbeResult::refused);
-    EXPECT_EQ(probeTcp({"fd07::1", 9}), ProbeResult::refused);
-    removeInterface("lan7");
-    EXPECT_EQ(if_nametoindex("lan7"), 0u);
-    if (!addTunInterface("tun0"))
-        GTEST_SKIP() << "no usable /dev/net/tun: the tun interface was not tried";
-    EXPECT_NE(if_nametoindex("tun0"), 0u);
-}
-
-TEST(Network, APairJoinsNamesInOneNamespace) {
-    addVethPair("eth0", "eth1");
-    EXPECT_NE(if_nametoindex("eth0"), 0u);
-    EXPECT_NE(if_nametoindex("eth1"), 0u);
-}
 
 }  // namespace

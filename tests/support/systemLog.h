@@ -3,6 +3,8 @@
 #ifndef VELD_TEST_SYSTEM_LOG_H
 #define VELD_TEST_SYSTEM_LOG_H
 
+#include "handle.h"
+
 #include <mutex>
 #include <string>
 #include <thread>
@@ -13,7 +15,6 @@ namespace veldtest {
 /// One message. `text` is what the caller of syslog() wrote; `priority` is LOG_ERR etc. without the facility.
 struct LogMessage {
     int priority;
-    std::string ident;
     std::string text;
 };
 
@@ -40,15 +41,11 @@ public:
 private:
     void drain();  // with m_mutex held
 
-    int m_socket = -1;
-    int m_stop = -1;
+    Handle m_socket;
     std::mutex m_mutex;
     std::vector<LogMessage> m_messages;
     std::thread m_reader;
 };
-
-/// Splits a datagram as syslog() of the C library sends it: "<priority>Mmm dd hh:mm:ss ident[pid]: text".
-LogMessage parseLogDatagram(const std::string &datagram);
 
 }  // namespace veldtest
 
