@@ -1,15 +1,18 @@
 // SPDX-License-Identifier: Apache-2.0
 // The evaluation of block queries: the state table row by row, port matches, the order of lists, the merge.
 #include "fw/blockQuery.h"
+#include "caseTable.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <sstream>
-
 using namespace FW;
+using namespace veldtest;
 
 namespace {
+
+const std::string caseDirectory = VELD_CASE_DIRECTORY;
+const PortCompareST tcp80 = {0, FW_PROTO_TCP, "80"};
 
 FW_POLICY policyOf(int number) {
     return static_cast<FW_POLICY>(number);
@@ -29,101 +32,29 @@ FWRULE portRule(int policy, const std::string &port, int ipGroup = FW_IP_GROUP_A
     return rule;
 }
 
-const PortCompareST tcp80 = {0, FW_PROTO_TCP, "80"};
-constexpr int limited = FW_IP_GROUP_ADDRESS;
-
-// One row per state before. Columns: the rule's policy 0, 1, 2, 3 and 9, first for rules of any source, then for rules
-// of some sources. An entry is the state after; "!" ends the list.
-const char *const stateTable = R"(
-0   0! 1! 2! 3! 9!    0  5  0  0  0
-1   0! 1! 2! 3! 9!    4  0  0  0  0
-2   0! 1! 2! 3! 9!    4  5  0  0  0
-3   0! 0! 0! 0! 0!    0! 0! 0! 0! 0!
-4   0! 4! 0! 0! 0!    0  3! 0! 0! 0!
-5   5! 1! 0! 0! 0!    3! 0  0! 0! 0!
-6   0! 0! 0! 0! 0!    0! 0! 0! 0! 0!
--1  0! 0! 0! 0! 0!    0! 0! 0! 0! 0!
-)";
-
 TEST(StateTable, EveryRowHolds) {
-    std::istringstream rows(stateTable);
-    int entries = 0;
-    for (int before = 0; rows >> before;) {
+    const auto rows = readCases(caseDirectory + "stateTable.cases", 3);
+    EXPECT_EQ(rows.size(), 8u);
+    for (const auto &row : rows) {
         for (const bool anySource : {true, false}) {
+            std::string after;
             for (const int policy : {0, 1, 2, 3, 9}) {
-                std::string after;
-                rows >> after;
-                const VerdictStep step = verdictAfter(policyOf(before), anySource, policyOf(policy));
-                const std::string got = std::to_string(static_cast<int>(step.verdict)) + (step.stop ? "!" : "");
-                EXPECT_EQ(got, after) << "state " << before << ", any source " << anySource << ", policy " << policy;
-                ++entries;
+                const VerdictStep step = verdictAfter(policyOf(std::stoi(row[0])), anySource, policyOf(policy));
+                const std::string state = std::to_string(static_cast<int>(step.verdict)) + (step.stop ? "!" : " ");
+                after += (after.empty() ? "" : " ") + state;
             }
+            after.erase(after.find_last_not_of(' ') + 1);
+            EXPECT_EQ(after, row[anySource ? 1 : 2]) << "state " << row[0] << ", any source " << anySource;
         }
     }
-    EXPECT_EQ(entries, 8 * 2 * 5);
 }
 
-struct PortCase {
-    int policy;
-    int ruleDirect;
-    int ruleProtocol;
-    std::vector<std::string> rulePorts;
-    PortCompareST query;
-    bool matches;
-};
-
 TEST(PortMatch, IsStrictForAllowAndLooseForDeny) {
-    const auto tcp = FW_PROTO_TCP;
-    const auto both = FW_PROTO_TCP_UDP;
-    const PortCase cases[] = {
-        {1, 0, 1, {"1000-2000"}, {0, tcp, "1500-2500"}, true},  // overlap is enough to deny
-        {0, 0, 1, {"1000-2000"}, {0, tcp, "1500-2500"}, false},
-        {0, 0, 1, {"1000-2000"}, {0, tcp, "1200-1300"}, true},
-        {2, 0, 1, {"1000-2000"}, {0, tcp, "1500-2500"}, false},  // every policy but deny is strict
-        {3, 0, 1, {"1000-2000"}, {0, tcp, "1000-2000"}, true},
-        {1, 0, 1, {"1000-2000"}, {0, tcp, "2000-2001"}, true},  // the bounds belong to the range
-        {1, 0, 1, {"1000-2000"}, {0, tcp, "1-1000"}, true},
-        {1, 0, 1, {"1000-2000"}, {0, tcp, "2001-2002"}, false},
-        {1, 0, 1, {"1000-2000"}, {0, tcp, "999"}, false},
-        {0, 0, 1, {"80", "1000-2000"}, {0, tcp, "1000-2001"}, false},
-        {0, 0, 1, {"80", "81"}, {0, tcp, "80-81"}, false},  // one entry must cover the query
-        {0, 0, 1, {"79", "80"}, {0, tcp, "80"}, true},
-        {1, 0, 1, {}, tcp80, false},
-        {0, 0, 1, {}, tcp80, false},
-        // protocols
-        {1, 0, 1, {"80"}, {0, both, "80"}, true},
-        {0, 0, 1, {"80"}, {0, both, "80"}, false},
-        {0, 0, 3, {"80"}, {0, both, "80"}, true},
-        {0, 0, 3, {"80"}, {0, FW_PROTO_UDP, "80"}, true},
-        {1, 0, 3, {"80"}, {0, FW_PROTO_UDP, "80"}, true},
-        {1, 0, 1, {"80"}, {0, FW_PROTO_UDP, "80"}, false},
-        {1, 0, 4, {"80"}, {0, FW_PROTO_ICMP, "80"}, true},
-        {1, 0, 4, {"80"}, {0, both, "80"}, true},
-        {1, 0, 9, {"80"}, tcp80, false},
-        // directions
-        {1, 1, 1, {"80"}, tcp80, false},
-        {1, 0, 1, {"80"}, {1, tcp, "80"}, false},
-        {0, 1, 1, {"80"}, {1, tcp, "80"}, true},
-        {1, 2, 1, {"80"}, {1, tcp, "80"}, false},  // compared as numbers
-        // port text goes through strtol: what is no number is 0, what follows a number is ignored
-        {1, 0, 1, {"http"}, {0, tcp, "0"}, true},
-        {1, 0, 1, {""}, {0, tcp, "0"}, true},
-        {1, 0, 1, {" 80x"}, tcp80, true},
-        {1, 0, 1, {"0x50"}, tcp80, false},
-        {1, 0, 1, {"80-"}, tcp80, false},  // 80 to 0
-        {1, 0, 1, {"80-"}, {0, tcp, "0"}, false},
-        {0, 0, 1, {"-80"}, tcp80, true},       // 0 to 80
-        {0, 0, 1, {"70--90"}, tcp80, false},   // 70 to -90
-        {0, 0, 1, {"70-90-75"}, tcp80, true},  // split at the first "-"
-        {1, 0, 1, {"90-70"}, tcp80, false},
-        {1, 0, 1, {"1-99999999999999999999"}, tcp80, true},
-        {0, 0, 1, {"1-100"}, {0, tcp, "90-10"}, true},
-    };
-    for (const PortCase &entry : cases) {
-        SCOPED_TRACE("case " + std::to_string(&entry - cases) + ": query " + entry.query.port);
-        EXPECT_EQ(
-            portsMatch(entry.ruleDirect, entry.ruleProtocol, entry.rulePorts, policyOf(entry.policy), entry.query),
-            entry.matches);
+    for (const auto &row : readCases(caseDirectory + "portMatches.cases", 8)) {
+        const auto number = [&](size_t column) { return std::stoi(row[column]); };
+        const PortCompareST query = {number(4), static_cast<FW_PORT_PROTOCOL>(number(5)), row[6]};
+        const bool matches = portsMatch(number(1), number(2), split(row[3], ','), policyOf(number(0)), query);
+        EXPECT_EQ(matches, row[7] == "yes") << testing::PrintToString(row);
     }
 }
 
@@ -136,22 +67,22 @@ TEST(RuleMatch, FollowsThePortGroup) {
     EXPECT_FALSE(ruleMatches(rule, tcp80, noServices));
     rule.enable = true;
     EXPECT_TRUE(ruleMatches(rule, {1, FW_PROTO_IGMP, ""}, noServices));
-    for (const int unknown : {4, -1}) {
-        rule.portGroup = unknown;
-        EXPECT_FALSE(ruleMatches(rule, tcp80, noServices));
-    }
+    rule.portGroup = 4;
+    EXPECT_FALSE(ruleMatches(rule, tcp80, noServices));
 }
 
 TEST(RuleMatch, ServicesCountBySideAndTheRulesOwnDirectionAndProtocolDoNot) {
     const auto expand = [](const std::vector<std::string> &names, ServPort &ports) {
-        if (names == std::vector<std::string>{"broken"}) {
-            return false;
-        }
         EXPECT_EQ(names, (std::vector<std::string>{"web", "mail"}));
         ports.srcPorts[FW_PROTO_UDP] = {"500"};
         ports.dstPorts[FW_PROTO_TCP] = {"25", "80-90"};
         ports.dstPorts[FW_PROTO_TCP_UDP] = {"53"};
         return true;
+    };
+    const std::pair<PortCompareST, bool> cases[] = {
+        {{0, FW_PROTO_TCP, "80"}, true},  {{0, FW_PROTO_UDP, "25"}, false},  {{0, FW_PROTO_UDP, "53"}, true},
+        {{1, FW_PROTO_UDP, "500"}, true}, {{0, FW_PROTO_UDP, "500"}, false}, {{1, FW_PROTO_TCP, "80"}, false},
+        {{2, FW_PROTO_TCP, "80"}, false},
     };
     for (const int group : {FW_PORT_GROUP_SERVICE, FW_PORT_GROUP_RESERVED}) {
         FWRULE rule;
@@ -159,155 +90,47 @@ TEST(RuleMatch, ServicesCountBySideAndTheRulesOwnDirectionAndProtocolDoNot) {
         rule.portDirect = 1;
         rule.protocol = FW_PROTO_IGMP;
         rule.portList = {"web", "mail"};
-        const std::pair<PortCompareST, bool> cases[] = {
-            {{0, FW_PROTO_TCP, "80"}, true},  {{0, FW_PROTO_TCP, "25"}, true},  {{0, FW_PROTO_UDP, "25"}, false},
-            {{0, FW_PROTO_UDP, "53"}, true},  {{1, FW_PROTO_UDP, "500"}, true}, {{0, FW_PROTO_UDP, "500"}, false},
-            {{1, FW_PROTO_TCP, "80"}, false}, {{2, FW_PROTO_TCP, "80"}, false}};
-        for (const auto &[query, matches] : cases) {
+        for (const auto &[query, matches] : cases)
             EXPECT_EQ(ruleMatches(rule, query, expand), matches) << query.portDirect << " " << query.port;
-        }
-        rule.portList = {"broken"};
-        EXPECT_FALSE(ruleMatches(rule, tcp80, expand));
     }
 }
 
-TEST(RuleList, PassesOverRulesThatDoNotMatchAndEndsWhereTheTableSays) {
-    const auto verdict = [](const std::vector<FWRULE> &rules, int start) {
-        return static_cast<int>(ruleListEvaluate(rules, tcp80, policyOf(start), noServices));
-    };
-    EXPECT_EQ(verdict({}, 2), 2);
-    EXPECT_EQ(verdict({portRule(1, "81")}, 0), 0);
-    EXPECT_EQ(verdict({portRule(1, "81"), portRule(1, "80"), portRule(0, "80")}, 0), 1);
-    EXPECT_EQ(verdict({portRule(1, "80", limited)}, 0), 5);
-    EXPECT_EQ(verdict({portRule(0, "80", limited)}, 1), 4);
-    EXPECT_EQ(verdict({portRule(0, "80", limited), portRule(1, "80", limited), portRule(0, "80")}, 1), 3);
-    EXPECT_EQ(verdict({portRule(1, "80", limited), portRule(1, "80"), portRule(0, "80")}, 0), 1);
-    EXPECT_EQ(verdict({portRule(0, "80", limited), portRule(1, "80")}, 1), 4);
-    EXPECT_EQ(verdict({portRule(0, "80", limited), portRule(0, "80", limited)}, 1), 0);  // the asymmetric entry
-    for (const int group : {0, 1, 2, 3, 4, 6}) {                                         // all but "any" are limited
-        EXPECT_EQ(verdict({portRule(1, "80", group)}, 0), 5) << group;
-    }
+TEST(RuleList, EveryAddressGroupButAnyIsForSomeSources) {
+    for (const int group : {0, 1, 2, 3, 4, 6})
+        EXPECT_EQ(ruleListEvaluate({portRule(1, "80", group)}, tcp80, FW_POLICY_ALLOW, noServices), 5) << group;
 }
 
-struct ProfileCase {
-    const char *what;
-    PolicyMap defaults;
-    std::map<std::string, std::vector<FWRULE>> rules;
-    const char *adapter;
-    PolicyMap verdicts;
-};
+/// "eth0=1 global=2"
+PolicyMap policiesOf(const std::string &text) {
+    PolicyMap policies;
+    for (const std::string &word : split(text, ' '))
+        policies[split(word, '=')[0]] = policyOf(std::stoi(split(word, '=')[1]));
+    return policies;
+}
+
+/// The letters of cases/profileVerdicts.cases.
+FWRULE ruleOf(char letter) {
+    if (letter == 'o')
+        return portRule(FW_POLICY_DENY, "81");
+    if (letter == 'N')
+        return portRule(FW_POLICY_NONE, "80");
+    const bool allows = letter == 'A' || letter == 'a';
+    const bool anySource = letter == 'A' || letter == 'D';
+    return portRule(allows ? 0 : 1, "80", anySource ? FW_IP_GROUP_ANY : FW_IP_GROUP_ADDRESS);
+}
 
 TEST(Profile, GlobalRulesDecideFirstThenEachAdapterForItself) {
-    const FW_POLICY allow = FW_POLICY_ALLOW, deny = FW_POLICY_DENY, none = FW_POLICY_NONE, partial = FW_POLICY_PARTIAL;
-    const auto allowAll = portRule(0, "80"), denyAll = portRule(1, "80");
-    const auto allowSome = portRule(0, "80", limited), denySome = portRule(1, "80", limited);
-    const auto other = portRule(1, "81");
-    const ProfileCase cases[] = {
-        {"empty profile", {}, {}, "", {{"global", none}}},
-        {"empty profile, one adapter", {}, {}, "eth0", {{"global", none}, {"eth0", allow}}},
-        {"defaults only", {{"eth0", deny}, {"global", none}}, {}, "", {{"global", none}, {"eth0", deny}}},
-        {"default of one adapter", {{"eth0", deny}, {"eth1", deny}}, {}, "eth0", {{"global", none}, {"eth0", deny}}},
-        {"a default for global counts", {{"global", deny}}, {}, "", {{"global", deny}}},
-        {"rules without default start from allow",
-         {},
-         {{"eth0", {denySome}}},
-         "",
-         {{"global", none}, {"eth0", partial}}},
-        {"without default the rules of one adapter are not reached when global has no list",
-         {},
-         {{"eth0", {denyAll}}},
-         "eth0",
-         {{"global", none}, {"eth0", allow}}},
-        {"with a global list they are",
-         {},
-         {{"eth0", {denyAll}}, {"global", {other}}},
-         "eth0",
-         {{"global", none}, {"eth0", deny}}},
-        {"an empty global list is a list",
-         {},
-         {{"eth0", {denyAll}}, {"global", {}}},
-         "eth0",
-         {{"global", none}, {"eth0", deny}}},
-        {"global decides for all adapters of the defaults, not for those with rules only",
-         {{"eth0", allow}, {"global", none}},
-         {{"eth0", {allowAll}}, {"eth1", {allowAll}}, {"global", {denyAll}}},
-         "",
-         {{"global", deny}, {"eth0", deny}}},
-        {"global allows all",
-         {{"eth0", deny}},
-         {{"eth0", {denyAll}}, {"global", {allowAll}}},
-         "eth0",
-         {{"global", allow}, {"eth0", allow}}},
-        {"global decides for an unknown adapter",
-         {},
-         {{"global", {denyAll}}},
-         "eth9",
-         {{"global", deny}, {"eth9", deny}}},
-        {"global is partly open",
-         {{"eth0", allow}},
-         {{"global", {denySome, allowSome}}},
-         "eth0",
-         {{"global", partial}, {"eth0", partial}}},
-        {"a mark of global does not decide",
-         {{"eth0", deny}, {"global", none}},
-         {{"eth0", {allowAll}}, {"global", {denySome}}},
-         "eth0",
-         {{"global", partial}, {"eth0", allow}}},
-        {"for all adapters the global list runs twice, on from its own mark",
-         {{"eth0", deny}, {"global", none}},
-         {{"eth0", {allowSome}}, {"global", {denySome}}},
-         "",
-         {{"global", allow}, {"eth0", partial}}},
-        {"the second run ends where a rule for all sources says",
-         {{"eth0", allow}, {"global", none}},
-         {{"global", {denySome, other, denyAll}}},
-         "",
-         {{"global", deny}, {"eth0", deny}}},
-        {"the adapter global itself is asked",
-         {{"global", none}},
-         {{"global", {allowSome}}},
-         "global",
-         {{"global", allow}}},
-        {"other adapters do not matter",
-         {{"eth0", allow}, {"eth1", allow}},
-         {{"eth1", {denyAll}}},
-         "eth0",
-         {{"global", none}, {"eth0", allow}}},
-        {"marks of defaults become partial",
-         {{"eth0", policyOf(4)}, {"eth1", policyOf(5)}},
-         {},
-         "",
-         {{"global", none}, {"eth0", partial}, {"eth1", partial}}},
-        {"rule policy none ends the list undecided",
-         {{"eth0", deny}},
-         {{"eth0", {portRule(2, "80")}}},
-         "eth0",
-         {{"global", none}, {"eth0", none}}},
-    };
-    for (const ProfileCase &entry : cases) {
-        SCOPED_TRACE(entry.what);
-        PolicyMap result;
-        profileEvaluate({"p", entry.rules, entry.defaults}, tcp80, entry.adapter, noServices, result);
-        EXPECT_EQ(result, entry.verdicts);
+    for (const auto &row : readCases(caseDirectory + "profileVerdicts.cases", 5)) {
+        FWPROFILE profile = {"p", {}, policiesOf(row[1])};
+        for (const std::string &word : split(row[2], ' ')) {
+            std::vector<FWRULE> &list = profile.rules[split(word, '=')[0]];
+            for (const char letter : word.substr(word.find('=') + 1))
+                list.push_back(ruleOf(letter));
+        }
+        PolicyMap result = {{"old", FW_POLICY_DENY}};
+        profileEvaluate(profile, tcp80, row[3], noServices, result);
+        EXPECT_EQ(result, policiesOf("old=1 " + row[4])) << row[0];
     }
-}
-
-TEST(Profile, EntriesAlreadyInTheResultStay) {
-    PolicyMap result = {{"old", FW_POLICY_DENY}, {"eth0", FW_POLICY_DENY}};
-    profileEvaluate({"p", {}, {{"eth0", FW_POLICY_ALLOW}}}, tcp80, "", noServices, result);
-    EXPECT_EQ(result, (PolicyMap{{"old", FW_POLICY_DENY}, {"eth0", FW_POLICY_ALLOW}, {"global", FW_POLICY_NONE}}));
-}
-
-TEST(ServiceQuery, AsksSourcePortsFirstInMapAndListOrder) {
-    ServPort ports;
-    ports.srcPorts[FW_PROTO_UDP] = {"9"};
-    ports.dstPorts[FW_PROTO_UDP] = {"5"};
-    ports.dstPorts[FW_PROTO_TCP] = {"7", "6"};
-    std::string order;
-    for (const PortCompareST &query : serviceQueries(ports)) {
-        order += std::to_string(query.portDirect) + "/" + std::to_string(query.protocol) + "/" + query.port + " ";
-    }
-    EXPECT_EQ(order, "1/2/9 0/1/7 0/1/6 0/2/5 ");
 }
 
 TEST(Merge, TheSeverestVerdictStays) {

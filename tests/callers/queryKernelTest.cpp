@@ -5,17 +5,17 @@
 // A query looks at the stored rules only and keeps one mark per adapter, so it is exact for a class of profiles. Left
 // out of the generated ones, because the verdict is documented to differ there (LeftOutConstructions shows how):
 //   - a rule for some sources whose policy is already the state (a second one of the same policy, a deny under a
-//   default
-//     of deny): it sets the state back to allow;
+//     default of deny): it sets the state back to allow;
 //   - the same with allow under a default of allow, when a deny for all sources follows: the exception is forgotten;
-//   - global rules that leave a mark (some sources, no rule that decides): the adapters' verdicts are formed without
-//   it;
+//   - global rules that leave a mark (some sources, no rule that decides): the adapters' verdicts are formed
+//     without it;
 //   - rules for some sources that overlap, or that together name every source: the query does not compare addresses;
 //   - rules that yield no command (address group "none", unknown countries) or act on something else than the query
 //     sees (destination addresses, outgoing interfaces, one address family, other tables): they count all the same;
 //   - policy and default "none" on an adapter: the verdict is "no decision", the kernel goes on and accepts;
 //   - queries for tcp and udp at once or for a range of ports: one verdict for several outcomes;
 //   - "vpn" and "pppoe", which the query takes for names while the kernel has their interfaces.
+#include "caseTable.h"
 #include "connections.h"
 #include "probeBatch.h"
 #include "realIptables.h"
@@ -84,6 +84,20 @@ struct KnownRule {
 
 using KnownRules = std::vector<KnownRule>;
 
+struct KnownService {
+    std::string name;
+    int direct;
+    bool tcp;
+    bool udp;
+    std::vector<uint16_t> ports;
+};
+
+const std::vector<KnownService> services = {{"files", 0, true, false, {21, 23}},
+                                            {"names", 0, true, true, {25, 26}},
+                                            {"media", 0, false, true, {22, 23, 24}},
+                                            {"clock", 1, false, true, {701}},
+                                            {"no-such-service", 0, true, true, {}}};
+
 class Generator {
 public:
     explicit Generator(unsigned seed) : m_random(seed) {}
@@ -135,22 +149,13 @@ private:
     }
 
     KnownRule serviceRule() {
-        static const KnownRules services = [] {
-            const auto service = [](const std::string &name, int direct, bool tcp, bool udp,
-                                    std::vector<uint16_t> ports) {
-                KnownRule rule;
-                rule.rule.portList = {name};
-                rule.direct = direct;
-                rule.tcp = tcp;
-                rule.udp = udp;
-                rule.ports = std::move(ports);
-                return rule;
-            };
-            return KnownRules{service("files", 0, true, false, {21, 23}), service("names", 0, true, true, {25, 26}),
-                              service("media", 0, false, true, {22, 23, 24}), service("clock", 1, false, true, {701}),
-                              service("no-such-service", 0, true, true, {})};
-        }();
-        KnownRule rule = services[static_cast<size_t>(below(static_cast<int>(services.size())))];
+        const KnownService &service = services[static_cast<size_t>(below(static_cast<int>(services.size())))];
+        KnownRule rule;
+        rule.rule.portList = {service.name};
+        rule.direct = service.direct;
+        rule.tcp = service.tcp;
+        rule.udp = service.udp;
+        rule.ports = service.ports;
         rule.rule.portGroup = chance(50) ? FW_PORT_GROUP_SERVICE : FW_PORT_GROUP_RESERVED;
         return rule;
     }
@@ -350,45 +355,32 @@ TEST_F(QueryAndKernel, AgreeForGeneratedProfiles) {
     EXPECT_GE(decidedByGlobal, 20);
 }
 
+/// Words of cases/leftOut.cases: "allow:2" for a host, "deny:" for all, "deny:none" for a rule without command.
+std::vector<FWRULE> rulesOf(const std::string &text) {
+    std::vector<FWRULE> rules;
+    for (const std::string &word : split(text, ' ')) {
+        const std::string host = word.substr(word.find(':') + 1);
+        const bool isHost = !host.empty() && host != "none";
+        const FW_POLICY policy = word[0] == 'a' ? FW_POLICY_ALLOW : FW_POLICY_DENY;
+        rules.push_back(veldtest::portRule(policy, "21", isHost ? "10.1.0." + host : ""));
+        if (host == "none")
+            rules.back().ipGroup = FW_IP_GROUP_NONE;
+    }
+    return rules;
+}
+
 TEST_F(QueryAndKernel, LeftOutConstructionsDifferAsDescribed) {
-    const FW_POLICY allow = FW_POLICY_ALLOW, deny = FW_POLICY_DENY, none = FW_POLICY_NONE, partly = FW_POLICY_PARTIAL;
-    const auto rule = [](FW_POLICY policy, const std::string &host) {
-        return portRule(policy, "21", host.empty() ? "" : "10.1.0." + host);
-    };
-    FWRULE withoutCommand = rule(deny, "");
-    withoutCommand.ipGroup = FW_IP_GROUP_NONE;
-    struct Case {
-        const char *what;
-        std::vector<FWRULE> global;
-        std::vector<FWRULE> eth0;
-        FW_POLICY start;
-        FW_POLICY query;
-        FW_POLICY kernel;
-    };
-    const Case cases[] = {
-        {"two hosts allowed under deny", {}, {rule(allow, "2"), rule(allow, "3")}, deny, allow, partly},
-        {"two hosts denied under allow", {}, {rule(deny, "2"), rule(deny, "3")}, allow, allow, partly},
-        {"a host denied under deny", {}, {rule(deny, "2")}, deny, allow, deny},
-        {"a host allowed, the rest denied, under allow", {}, {rule(allow, "2"), rule(deny, "")}, allow, deny, partly},
-        {"a host denied globally", {rule(deny, "2")}, {}, allow, allow, partly},
-        {"the same host denied after it was allowed",
-         {},
-         {rule(allow, "2"), rule(deny, "2"), rule(allow, "")},
-         deny,
-         partly,
-         allow},
-        {"a rule without command", {}, {withoutCommand}, allow, partly, allow},
-        {"default none", {}, {}, none, none, allow},
-    };
-    for (const Case &entry : cases) {
-        SCOPED_TRACE(entry.what);
-        FWPROFILE profile = {"p", {{"eth0", entry.eth0}}, {{"eth0", entry.start}, {"global", none}}};
-        if (!entry.global.empty())
-            profile.rules["global"] = entry.global;
+    for (const auto &row : readCases(VELD_CASE_DIRECTORY "leftOut.cases", 6)) {
+        SCOPED_TRACE(row[0]);
+        const auto policy = [&](size_t column) { return static_cast<FW_POLICY>(std::stoi(row[column])); };
+        FWPROFILE profile = {"p", {}, {{"eth0", policy(3)}, {"global", FW_POLICY_NONE}}};
+        profile.rules["eth0"] = rulesOf(row[2]);
+        if (!row[1].empty())
+            profile.rules["global"] = rulesOf(row[1]);
         ASSERT_NO_FATAL_FAILURE(apply(profile));
         const Query query = {"eth0", 0, FW_PROTO_TCP, 21};
-        EXPECT_EQ(verdict(query, "eth0"), entry.query);
-        expectObserved({query}, {entry.kernel});
+        EXPECT_EQ(verdict(query, "eth0"), policy(4));
+        expectObserved({query}, {policy(5)});
     }
 }
 

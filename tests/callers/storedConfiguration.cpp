@@ -87,4 +87,9 @@ std::vector<std::string> errorsOf(SystemLog &log) {
     return errors;
 }
 
+std::string lastError(SystemLog &log) {
+    const auto errors = errorsOf(log);
+    return errors.empty() ? "" : errors.back();
+}
+
 }  // namespace veldtest

@@ -38,6 +38,8 @@ FW::FWRULE serviceRule(FW::FW_POLICY policy, const std::vector<std::string> &ser
 
 /// The error messages of the library (not of the platform) without line numbers: "veldFW.cpp Failed to profileEnum()".
 std::vector<std::string> errorsOf(SystemLog &log);
+/// The last of them, empty when there is none.
+std::string lastError(SystemLog &log);
 
 }  // namespace veldtest
 

@@ -18,7 +18,6 @@
 using namespace FW;
 using namespace veldtest;
 using testing::Contains;
-using testing::ElementsAre;
 using testing::IsEmpty;
 
 namespace {
@@ -27,69 +26,37 @@ FWPROFILE profileNamed(const std::string &name, const std::vector<FWRULE> &globa
     return {name, {{"global", globalRules}}, {{"global", FW_POLICY_NONE}}};
 }
 
-std::vector<std::string> portsOf(const std::string &profile) {
-    std::vector<std::string> ports;
-    const FWPROFILE stored = storedProfile(profile);
-    for (const FWRULE &rule : stored.rules.at("global"))
-        ports.push_back(rule.portList.at(0));
-    return ports;
-}
-
-class TestCopy : public testing::Test {
-protected:
-    void SetUp() override {
-        storeProfile("1.json", profileNamed("p", {portRule(FW_POLICY_DENY, "1")}));
-        storeSettings(true, "p");
-    }
-
+TEST(TestCopy, IsStoredBesideTheProfileReplacedByTheNextAndAdopted) {
     SystemLog log;
     VELDFW_PROFILE profiles;
-};
-
-TEST_F(TestCopy, IsStoredBesideTheProfileAndReplacedByTheNext) {
-    EXPECT_TRUE(profiles.CreateTestProfile("p", profileNamed("p", {portRule(FW_POLICY_DENY, "2")})));
-    EXPECT_TRUE(profiles.CreateTestProfile("p", profileNamed("p", {portRule(FW_POLICY_DENY, "3")})));
-    EXPECT_EQ(storedProfile(".test_p").name, ".test_p");
-    EXPECT_THAT(portsOf(".test_p"), ElementsAre("3"));
-    EXPECT_THAT(portsOf("p"), ElementsAre("1"));
-    EXPECT_EQ(listDirectory(profileDirectory).size(), 3u);
-    EXPECT_THAT(errorsOf(log), IsEmpty());
-}
-
-TEST_F(TestCopy, AdoptedReplacesTheProfileAndStays) {
-    EXPECT_TRUE(profiles.CreateTestProfile("p", profileNamed("other", {portRule(FW_POLICY_DENY, "2")})));
-    EXPECT_TRUE(profiles.AdoptTestProfile("p"));
-    EXPECT_EQ(storedProfile("p").name, "p");
-    EXPECT_THAT(portsOf("p"), ElementsAre("2"));
-    EXPECT_TRUE(profiles.profileExist(".test_p"));
-    EXPECT_TRUE(profiles.RemoveTestProfile("p"));
-    EXPECT_FALSE(profiles.profileExist(".test_p"));
-    EXPECT_THAT(portsOf("p"), ElementsAre("2"));
-    EXPECT_TRUE(profiles.CreateTestProfile("new", profileNamed("new", {portRule(FW_POLICY_DENY, "4")})));
-    EXPECT_TRUE(profiles.AdoptTestProfile("new"));  // a profile that did not exist
-    EXPECT_THAT(portsOf("new"), ElementsAre("4"));
-    EXPECT_THAT(errorsOf(log), IsEmpty());
-}
-
-TEST_F(TestCopy, EachFailureHasItsMessage) {
-    const auto lastError = [&] { return errorsOf(log).empty() ? "" : errorsOf(log).back(); };
-    const std::string before = readFile(profileDirectory + "1.json");
+    const auto portOf = [](const std::string &name) { return storedProfile(name).rules["global"].at(0).portList[0]; };
+    storeProfile("1.json", profileNamed("p", {portRule(FW_POLICY_DENY, "1")}));
+    storeSettings(true, "p");
     EXPECT_FALSE(profiles.AdoptTestProfile("p"));
-    EXPECT_THAT(errorsOf(log), ElementsAre("veldFW.cpp profile does not exist"));
-    EXPECT_EQ(readFile(profileDirectory + "1.json"), before);
+    EXPECT_EQ(lastError(log), "veldFW.cpp profile does not exist");
     EXPECT_TRUE(profiles.RemoveTestProfile("p"));  // the database deletes what is not there
-    EXPECT_TRUE(profiles.CreateTestProfile("p", {}));
+    for (const std::string port : {"2", "3"}) {
+        EXPECT_TRUE(profiles.CreateTestProfile("p", profileNamed("other", {portRule(FW_POLICY_DENY, port)})));
+        EXPECT_EQ(portOf(".test_p"), port);
+        EXPECT_EQ(portOf("p"), "1");
+        EXPECT_EQ(listDirectory(profileDirectory).size(), 3u);
+    }
     makeDirectories(profileDirectory + "1.json.tmp");  // in the way of the write
     EXPECT_FALSE(profiles.AdoptTestProfile("p"));
-    EXPECT_EQ(lastError(), "veldFW.cpp failed to profileSet()");
+    EXPECT_EQ(lastError(log), "veldFW.cpp failed to profileSet()");
+    removeAll(profileDirectory + "1.json.tmp");
+    EXPECT_TRUE(profiles.AdoptTestProfile("p"));
+    EXPECT_EQ(storedProfile("p").name, "p");
+    EXPECT_EQ(portOf("p"), "3");
+    EXPECT_TRUE(profiles.profileExist(".test_p"));
     storeSettings(true, ".test_p");  // in force, so that it cannot be deleted
+    EXPECT_FALSE(profiles.CreateTestProfile("p", {}));
     EXPECT_FALSE(profiles.RemoveTestProfile("p"));
-    EXPECT_EQ(lastError(), "veldFW.cpp failed to profileDelete()");
-    EXPECT_FALSE(profiles.CreateTestProfile("p", {}));
-    EXPECT_EQ(lastError(), "veldFW.cpp failed to profileDelete()");
-    removeAll(profileDirectory);
-    EXPECT_FALSE(profiles.CreateTestProfile("p", {}));
-    EXPECT_EQ(lastError(), "veldFW.cpp failed to profileCreate()");
+    EXPECT_EQ(lastError(log), "veldFW.cpp failed to profileDelete()");
+    storeSettings(true, "p");
+    EXPECT_TRUE(profiles.RemoveTestProfile("p"));
+    EXPECT_FALSE(profiles.profileExist(".test_p"));
+    EXPECT_EQ(portOf("p"), "3");
 }
 
 class TrialCommands : public testing::Test {
@@ -118,113 +85,62 @@ protected:
 const std::vector<std::string> dropPolicies = {
     "/sbin/iptables --policy INPUT DROP", "/sbin/iptables --policy FORWARD DROP", "/sbin/ip6tables --policy INPUT DROP",
     "/sbin/ip6tables --policy FORWARD DROP"};
-const std::vector<std::string> flushes = {"/sbin/iptables -F INPUT_FIREWALL", "/sbin/ip6tables -F INPUT_FIREWALL",
-                                          "/sbin/iptables -F FORWARD_FIREWALL", "/sbin/ip6tables -F FORWARD_FIREWALL"};
-const std::vector<std::string> acceptPolicies = {
-    "/sbin/iptables --policy INPUT ACCEPT", "/sbin/iptables --policy FORWARD ACCEPT",
+const std::vector<std::string> flushesAndAccept = {
+    "/sbin/iptables -F INPUT_FIREWALL",      "/sbin/ip6tables -F INPUT_FIREWALL",
+    "/sbin/iptables -F FORWARD_FIREWALL",    "/sbin/ip6tables -F FORWARD_FIREWALL",
+    "/sbin/iptables --policy INPUT ACCEPT",  "/sbin/iptables --policy FORWARD ACCEPT",
     "/sbin/ip6tables --policy INPUT ACCEPT", "/sbin/ip6tables --policy FORWARD ACCEPT"};
 
 TEST_F(TrialCommands, ClientDecidesWhoseEstablishedConnectionsAreKept) {
-    struct Case {
-        std::string client;
-        std::vector<std::string> kept;
-    };
-    const Case cases[] = {
+    const std::pair<std::string, std::vector<std::string>> cases[] = {
         {"", {}},
         {"10.1.0.2",
          {"/sbin/iptables -A INPUT_FIREWALL ! -s 10.1.0.2", "/sbin/iptables -A FORWARD_FIREWALL ! -s 10.1.0.2",
           "/sbin/ip6tables -A INPUT_FIREWALL", "/sbin/ip6tables -A FORWARD_FIREWALL"}},
-        {"fd01::2",
-         {"/sbin/iptables -A INPUT_FIREWALL", "/sbin/iptables -A FORWARD_FIREWALL",
-          "/sbin/ip6tables -A INPUT_FIREWALL ! -s fd01::2", "/sbin/ip6tables -A FORWARD_FIREWALL ! -s fd01::2"}},
     };
-    for (const Case &entry : cases) {
-        SCOPED_TRACE(entry.client);
+    for (const auto &[client, kept] : cases) {
         recorder.clear();
-        EXPECT_TRUE(VELDFW().TestApplyingProfile("p", entry.client));
-        EXPECT_EQ(establishedRules(), entry.kept);
+        EXPECT_TRUE(VELDFW().TestApplyingProfile("p", client));
+        EXPECT_EQ(establishedRules(), kept);
         const auto lines = recorder.lines();
         ASSERT_GT(lines.size(), 12u);
         EXPECT_TRUE(std::equal(dropPolicies.begin(), dropPolicies.end(), lines.begin()));
-        EXPECT_TRUE(std::equal(flushes.begin(), flushes.end(), lines.begin() + 4));
-        EXPECT_TRUE(std::equal(acceptPolicies.begin(), acceptPolicies.end(), lines.end() - 4));
+        EXPECT_TRUE(std::equal(flushesAndAccept.begin(), flushesAndAccept.begin() + 4, lines.begin() + 4));
+        EXPECT_TRUE(std::equal(flushesAndAccept.begin() + 4, flushesAndAccept.end(), lines.end() - 4));
         EXPECT_THAT(lines, Contains("/sbin/iptables -t filter -A INPUT_FIREWALL -p tcp --dport 80 -j DROP"));
     }
-    const auto withEmptyClient = [&] {
-        recorder.clear();
-        EXPECT_TRUE(VELDFW().TestApplyingProfile("p", ""));
-        return recorder.lines();
-    }();
-    recorder.clear();
-    EXPECT_TRUE(VELDFW().TestApplyingProfile("p"));
-    EXPECT_EQ(recorder.lines(), withEmptyClient);
+    EXPECT_TRUE(VELD_IPTABLES_MODULES::isModuleLoad("firewall"));
+    EXPECT_FALSE(storedStatus()) << "a trial leaves the switch alone";
     EXPECT_THAT(errorsOf(log), IsEmpty());
 }
 
-TEST_F(TrialCommands, LoadsModulesButLeavesSwitchAndActiveProfileAlone) {
-    EXPECT_FALSE(VELD_IPTABLES_MODULES::isModuleLoad("firewall"));
-    EXPECT_TRUE(VELDFW().TestApplyingProfile("p"));
-    EXPECT_TRUE(VELD_IPTABLES_MODULES::isModuleLoad("firewall"));
-    EXPECT_FALSE(storedStatus());
-    std::string active;
-    EXPECT_TRUE(VELDFW().fwProfileConfigGet(active));
-    EXPECT_EQ(active, "p");
-}
-
-struct FailureCase {
-    const char *what;
-    std::string failing;                ///< part of the command that is refused
-    std::string client;                 ///
-    std::vector<std::string> lastRuns;  ///< how the recorded commands end
-    bool statusAfter;                   ///< the switch, on before
-    std::string error;                  ///< last message of the trial itself
-};
-
 TEST_F(TrialCommands, AFailureNeverLeavesTheMachineLockedOut) {
-    auto flushesAndAccept = flushes;
-    flushesAndAccept.insert(flushesAndAccept.end(), acceptPolicies.begin(), acceptPolicies.end());
-    const FailureCase cases[] = {
-        {"drop is refused",
-         "INPUT DROP",
-         "",
-         {dropPolicies[0]},
-         true,
-         "veldFW.cpp Failed to fwExec() to set default drop."},
-        {"flush is refused", "ip6tables -F INPUT", "", flushesAndAccept, true, "veldFW.cpp Failed to fwClear()"},
-        {"no address", "", "nonsense", flushesAndAccept, true, "veldFW.cpp Failed to fwIptablesRulesEnum()"},
-        {"a rule is refused", "--dport 80", "", flushesAndAccept, false,
-         "veldFW.cpp Failed to fwExec() so disable firewall"},
-        {"accept is refused", "ip6tables --policy INPUT ACCEPT", "", flushes, false,
-         "veldFW.cpp Failed to fwExec() to set default accept."},
+    struct Failure {
+        const char *profile, *client;
+        std::string refused;  ///< part of the command
+        std::string lastRun;
+        bool statusAfter;  ///< the switch, on before
+        std::string error;
     };
-    for (const FailureCase &entry : cases) {
-        SCOPED_TRACE(entry.what);
+    const std::string opened = flushesAndAccept.back(), flushed = flushesAndAccept[3];
+    const Failure failures[] = {
+        {"p", "", "INPUT DROP", dropPolicies[0], true, "Failed to fwExec() to set default drop."},
+        {"p", "", "ip6tables -F INPUT", opened, true, "Failed to fwClear()"},
+        {"p", "nonsense", "nothing", opened, true, "Failed to fwIptablesRulesEnum()"},
+        {"unknown", "", "nothing", opened, true, "Failed to fwIptablesRulesEnum()"},
+        {"p", "", "--dport 80", opened, false, "Failed to fwExec() so disable firewall"},
+        {"p", "", "ip6tables --policy INPUT ACCEPT", flushed, false, "Failed to fwExec() to set default accept."},
+    };
+    for (const Failure &failure : failures) {
+        SCOPED_TRACE(failure.error);
         storeSettings(true, "p");
         recorder.clear();
-        log.clear();
-        if (!entry.failing.empty())
-            recorder.failMatching(entry.failing);
-        EXPECT_FALSE(VELDFW().TestApplyingProfile("p", entry.client));
-        const auto lines = recorder.lines();
-        ASSERT_GE(lines.size(), entry.lastRuns.size());
-        EXPECT_EQ(std::vector<std::string>(lines.end() - static_cast<long>(entry.lastRuns.size()), lines.end()),
-                  entry.lastRuns);
-        EXPECT_EQ(storedStatus(), entry.statusAfter);
-        EXPECT_EQ(errorsOf(log).back(), entry.error);
+        recorder.failMatching(failure.refused);
+        EXPECT_FALSE(VELDFW().TestApplyingProfile(failure.profile, failure.client));
+        EXPECT_EQ(recorder.lines().back(), failure.lastRun);
+        EXPECT_EQ(storedStatus(), failure.statusAfter);
+        EXPECT_EQ(lastError(log), "veldFW.cpp " + failure.error);
     }
-}
-
-TEST_F(TrialCommands, NeedsATestCopyAndItsModules) {
-    EXPECT_FALSE(VELDFW().TestApplyingProfile("unknown"));
-    EXPECT_THAT(errorsOf(log), Contains("veldFW.cpp Failed to profileGet(.test_unknown)"));
-    EXPECT_EQ(errorsOf(log).back(), "veldFW.cpp Failed to fwIptablesRulesEnum()");
-    EXPECT_EQ(recorder.lines().back(), acceptPolicies.back());
-    removeAll("/usr/veld/etc.defaults/iptables_modules_list");
-    removeAll(moduleStateFile);
-    recorder.clear();
-    EXPECT_FALSE(VELDFW().TestApplyingProfile("p"));
-    EXPECT_EQ(errorsOf(log).back(), "veldFW.cpp Failed to firewallModLoad()");
-    EXPECT_THAT(recorder.lines(), IsEmpty());
 }
 
 /// Two hosts behind one interface, each with a connection to port 80 that the active profile lets through.
@@ -286,10 +202,15 @@ TEST_F(TrialOnTheKernel, OfAClientCutsOffItsConnectionOnlyAndEndsWithTheNextRelo
     EXPECT_EQ(m_others->exchange(untilSentAgain), ProbeResult::connected);
 }
 
-TEST_F(TrialOnTheKernel, WithoutAClientCutsOffEverybody) {
+TEST_F(TrialOnTheKernel, OfASwitchedOffFirewallWithoutAClientCutsOffEverybodyUntilItIsEnabled) {
+    ASSERT_TRUE(VELDFW().fwDisable());
     tryProfile({}, "");
+    EXPECT_FALSE(storedStatus());
     EXPECT_EQ(m_testers->exchange(), ProbeResult::timedOut);
     EXPECT_EQ(m_others->exchange(), ProbeResult::timedOut);
+    expectNewConnections(ProbeResult::timedOut, ProbeResult::timedOut);
+    ASSERT_TRUE(VELDFW().fwEnable());
+    expectNewConnections(ProbeResult::connected, ProbeResult::connected);
 }
 
 TEST_F(TrialOnTheKernel, LetsTheClientsConnectionLiveWhenTheProfileItselfDoes) {
@@ -297,15 +218,6 @@ TEST_F(TrialOnTheKernel, LetsTheClientsConnectionLiveWhenTheProfileItselfDoes) {
     EXPECT_EQ(m_testers->exchange(untilSentAgain), ProbeResult::connected);
     EXPECT_EQ(m_others->exchange(untilSentAgain), ProbeResult::connected);
     expectNewConnections(ProbeResult::connected, ProbeResult::timedOut);
-}
-
-TEST_F(TrialOnTheKernel, IsAppliedToASwitchedOffFirewallThatStaysOff) {
-    ASSERT_TRUE(VELDFW().fwDisable());
-    tryProfile({}, "");
-    EXPECT_FALSE(storedStatus());
-    expectNewConnections(ProbeResult::timedOut, ProbeResult::timedOut);
-    ASSERT_TRUE(VELDFW().fwEnable());
-    expectNewConnections(ProbeResult::connected, ProbeResult::connected);
 }
 
 }  // namespace

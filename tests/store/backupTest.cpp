@@ -1,8 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // Export and import of the whole configuration, trusted and hostile.
+#include "caseTable.h"
 #include "storeFixture.h"
-
-#include <unistd.h>
 
 using namespace veldtest;
 using testing::ElementsAre;
@@ -55,95 +54,38 @@ TEST_F(Backup, AnUnreadableProfileIsLeftOutUnlessItIsTheActiveOne) {
     takeErrors();
     Json::Value second;
     EXPECT_FALSE(db.exportConfig(second));
-    EXPECT_EQ(takeErrors().back(), "fwDB.cpp Failed to load json from [" + profileDirectory +
-                                       "1700000001.json] for profile [a] which is the current one.");
+    EXPECT_EQ(takeLastError(), "fwDB.cpp Failed to load json from [" + profileDirectory +
+                                   "1700000001.json] for profile [a] which is the current one.");
     removeAll(profileDirectory + "1700000001.json");
     EXPECT_TRUE(db.exportConfig(second)) << "an active profile that was never stored is not missed";
 }
 
-TEST_F(Backup, AnExportNeedsTheSettings) {
-    for (const char *settings : {"broken", "[]", "{\"profile\": {}}"}) {
-        writeFile(settingsPath, settings);
-        Json::Value out;
-        EXPECT_FALSE(db.exportConfig(out)) << settings;
-        EXPECT_EQ(takeErrors().back(), "fwDB.cpp Falied to get firewall settings.");
-    }
-}
-
 TEST_F(Backup, DocumentsOfEveryKindAreImportedAsTheyAre) {
-    const auto dumpFailed = [](const std::string &name) {
-        return "fwDB.cpp Failed to jsonFileDump [" + profileDirectory + name + "].";
-    };
-    const auto openFailed = [](const std::string &name) {
-        return "utils.cpp Failed to open json file " + profileDirectory + name + ".tmp";
-    };
-    const std::string longName(251, 'n');
-    const struct {
-        std::string document;
-        std::vector<std::string> files;  // afterwards, beside the settings
-        const char *settings;
-        std::vector<std::string> errors;
-    } cases[] = {
-        {"null", {}, "{'profile': 'a', 'status': false}", {}},
-        {"{}", {}, "{'profile': 'a', 'status': false}", {}},
-        {"{'config_profiles': 5, 'config_firewall_settings': 'x', 'config_version': {}}",
-         {},
-         "{'profile': 'a', 'status': false}",
-         {}},
-        {"{'config_firewall_settings': {'status': 'x'}}", {}, "{'profile': 'a', 'status': 'x'}", {}},
-        {"{'config_profiles': {'1.json': 5, '2.json': {'name': 'n'}, 'no extension': [], '.json': null}}",
-         {".json", "1.json", "2.json", "no extension"},
-         "{'profile': 'a', 'status': false}",
-         {}},
-        {"{'config_profiles': {'../../escaped.json': {}, 'sub/1.json': {}, '2.json': {}}}",
-         {"2.json"},
-         "{'profile': 'a', 'status': false}",
-         {openFailed("sub/1.json"), dumpFailed("sub/1.json")}},
-        {"{'config_profiles': {'..': {}, '1.json': {}}}",
-         {"1.json"},
-         "{'profile': 'a', 'status': false}",
-         {"utils.cpp Failed to rename to " + profileDirectory + "..", dumpFailed("..")}},
-        {"{'config_profiles': [{'name': 'n'}]}",
-         {},
-         "{'profile': 'a', 'status': false}",
-         {"utils.cpp Failed to rename to " + profileDirectory, dumpFailed("")}},
-        {"{'config_profiles': {'" + longName + "': {}, 'z': {}}}",
-         {"z"},
-         "{'profile': 'a', 'status': false}",
-         {"utils.cpp Failed to open json file " + profileDirectory + longName +
-              ": the name is too long for its lock file",
-          dumpFailed(longName)}},
-        {"{'config_profiles': {'firewall_settings.json': {'profile': 'x'}}}", {}, "{'profile': 'x'}", {}},
-    };
-    for (const auto &c : cases) {
-        SCOPED_TRACE(c.document.substr(0, 100));
+    for (const auto &row : readCases(caseDirectory + "imports.cases", 3)) {
+        SCOPED_TRACE(row[0]);
         removeAll(profileDirectory);
         store("1700000001.json", namedDocument("a"));
         storeSettings("a");
-        EXPECT_TRUE(db.importConfig(json(c.document)));
-        EXPECT_EQ(takeErrors(), c.errors);
-        std::vector<std::string> files = c.files;
+        EXPECT_TRUE(db.importConfig(json(row[0])));
+        std::vector<std::string> files = split(row[1], ' ');
         files.emplace_back("firewall_settings.json");
         EXPECT_THAT(listDirectory(profileDirectory), testing::UnorderedElementsAreArray(files));
-        EXPECT_EQ(storedJson("firewall_settings.json"), json(c.settings));
+        EXPECT_EQ(storedJson("firewall_settings.json"), json(row[2]));
     }
     EXPECT_TRUE(pathExists("/usr/veld/escaped.json")) << "member names are file names, unchanged";
     EXPECT_THAT(listDirectory("/usr/veld/etc"), ElementsAre("firewall.d"));
 }
 
-TEST_F(Backup, AValueThatCannotHaveMembersThrowsBeforeAnythingIsDeleted) {
-    for (const char *document : {"5", "[]", "'text'"}) {
+TEST_F(Backup, WhatCannotHaveMembersThrowsBeforeAnythingIsDeletedAndUnreadableSettingsFailBoth) {
+    for (const char *document : {"5", "[]", "'text'"})
         EXPECT_THROW(db.importConfig(json(document)), Json::LogicError) << document;
-        EXPECT_THAT(names(), ElementsAre("a", "b"));
-    }
-}
-
-TEST_F(Backup, SettingsThatCannotBeStoredFailTheImport) {
+    EXPECT_THAT(names(), ElementsAre("a", "b"));
     writeFile(settingsPath, "[]");
+    Json::Value out;
+    EXPECT_FALSE(db.exportConfig(out));
+    EXPECT_EQ(takeLastError(), "fwDB.cpp Falied to get firewall settings.");
     EXPECT_FALSE(db.importConfig(json("{'config_profiles': {'1.json': {'name': 'n'}}}")));
-    EXPECT_THAT(takeErrors(),
-                ElementsAre("veldFW.cpp " + settingsPath + " holds no object",
-                            "veldFW.cpp Falied to config.configGet()", "fwDB.cpp Falied to set firewall settings."));
+    EXPECT_EQ(takeLastError(), "fwDB.cpp Falied to set firewall settings.");
     EXPECT_THAT(names(), ElementsAre("n"));
 }
 

@@ -6,35 +6,11 @@
 #include <unistd.h>
 
 using namespace veldtest;
-using testing::Contains;
 using testing::ElementsAre;
-using testing::IsEmpty;
 
 namespace {
 
 const std::string hostile = profileDirectory + "5.json";
-
-struct HostileFile {
-    std::string name;
-    std::function<void()> make;
-    bool reported = true;  ///< or skipped without a word
-};
-
-void PrintTo(const HostileFile &file, std::ostream *out) {
-    *out << file.name;
-}
-
-HostileFile text(const std::string &name, const std::string &content) {
-    return {name, [content] { writeFile(hostile, content); }, true};
-}
-
-HostileFile foreign(const std::string &name, const std::string &content) {
-    return {name, [content] { writeFile(hostile, content); }, false};
-}
-
-HostileFile link(const std::string &name, const char *target) {
-    return {name, [target] { ASSERT_EQ(symlink(target, hostile.c_str()), 0); }, true};
-}
 
 std::string nested(const std::string &opening, size_t depth) {
     std::string result;
@@ -43,58 +19,67 @@ std::string nested(const std::string &opening, size_t depth) {
     return result;
 }
 
-class HostileFiles : public Store, public testing::WithParamInterface<HostileFile> {};
+class HostileFiles : public Store {
+protected:
+    void expectOnlyItselfHidden(const std::string &what, bool reported) {
+        SCOPED_TRACE(what);
+        store("1.json", namedDocument("first"));
+        store("7.json", namedDocument("last"));
+        storeSettings("first");
+        FW::VELDFW_PROFILE manager;
+        takeErrors();
+        EXPECT_THAT(names(), ElementsAre("first", "last"));
+        EXPECT_EQ(log.count("Failed to load json from " + profileDirectory), reported ? 1u : 0u);
+        FW::FWPROFILE profile;
+        EXPECT_TRUE(manager.profileGet("last", profile));
+        std::map<std::string, FW::FWPROFILE> profiles;
+        EXPECT_TRUE(manager.profileEnum(profiles));
+        EXPECT_EQ(profiles.size(), 2u);
+        EXPECT_TRUE(manager.profileSet("last", profile));
+        EXPECT_TRUE(manager.profileRename("last", "renamed"));
+        Json::Value exported;
+        EXPECT_TRUE(db.exportConfig(exported));
+        EXPECT_EQ(exported["config_profiles"].size(), 2u);
+        EXPECT_TRUE(manager.profileDelete("renamed"));
+        EXPECT_THAT(names(), ElementsAre("first"));
+        removeAll(hostile);
+    }
+};
 
-TEST_P(HostileFiles, HideNothingButThemselves) {
-    GetParam().make();
-    store("1.json", namedDocument("first"));
-    store("7.json", namedDocument("last"));
-    storeSettings("first");
-    FW::VELDFW_PROFILE manager;
-    EXPECT_THAT(names(), ElementsAre("first", "last"));
-    const auto errors = takeErrors();
-    if (GetParam().reported)
-        EXPECT_THAT(errors, Contains(testing::StartsWith("fwDB.cpp Failed to load json from " + profileDirectory)));
-    else
-        EXPECT_THAT(errors, IsEmpty());
-    FW::FWPROFILE profile;
-    EXPECT_TRUE(manager.profileGet("last", profile));
-    std::map<std::string, FW::FWPROFILE> profiles;
-    EXPECT_TRUE(manager.profileEnum(profiles));
-    EXPECT_EQ(profiles.size(), 2u);
-    EXPECT_TRUE(manager.profileSet("last", profile));
-    EXPECT_TRUE(manager.profileCreate("new"));
-    EXPECT_TRUE(manager.profileRename("last", "renamed"));
-    EXPECT_TRUE(manager.profileDelete("renamed"));
-    bool enabled = true;
-    EXPECT_TRUE(FW::VELDFW().fwStatus(enabled));
-    Json::Value exported;
-    EXPECT_TRUE(db.exportConfig(exported));
-    EXPECT_EQ(exported["config_profiles"].size(), 2u);
-    EXPECT_THAT(names(), ElementsAre("first", "new"));
+TEST_F(HostileFiles, OfBrokenTextHideNothingButThemselves) {
+    const std::string rules = "{\"name\": \"x\", \"rules\": ";
+    const std::string broken[] = {"",
+                                  rules + "{",
+                                  "\x7f ELF",
+                                  std::string(5000, '\0'),
+                                  nested("[", 100'000),
+                                  nested("{\"a\":", 100'000),
+                                  rules + nested("[", 2000) + nested("]", 2000) + "}",
+                                  std::string(100'000'000, ' ')};
+    for (const std::string &text : broken) {
+        writeFile(hostile, text);
+        expectOnlyItselfHidden(text.substr(0, 30), true);
+    }
+    for (const char *foreign : {"[{\"name\": \"x\"}]", "\"name\"", "5", "null", "{\"rules\": {}}", "{\"name\": {}}"}) {
+        writeFile(hostile, foreign);
+        expectOnlyItselfHidden(foreign, false);
+    }
 }
 
-INSTANTIATE_TEST_SUITE_P(
-    , HostileFiles,
-    testing::Values(text("Empty", ""), text("Truncated", "{\"name\": \"x\", \"rules\": {"),
-                    text("NoJson", "\x7f"
-                                   "ELF"),
-                    text("ZeroBytes", std::string(5000, '\0')), text("NestedBrackets", nested("[", 100'000)),
-                    text("NestedObjects", nested("{\"a\":", 100'000)),
-                    text("NestedRules", "{\"name\": \"x\", \"rules\": " + nested("[", 2000) + nested("]", 2000) + "}"),
-                    HostileFile{"Blanks", [] { writeFile(hostile, std::string(100'000'000, ' ')); }, true},
-                    HostileFile{"Directory", [] { makeDirectories(hostile); }, true},
-                    HostileFile{"Fifo", [] { ASSERT_EQ(mkfifo(hostile.c_str(), 0666), 0); }, true},
-                    HostileFile{"LongName", [] { store(std::string(250, 'x') + ".json", namedDocument("x")); }, true},
-                    link("DanglingLink", "nowhere"), link("LinkToItself", "5.json"), link("EndlessDevice", "/dev/zero"),
-                    foreign("ArrayRoot", "[{\"name\": \"x\"}]"), foreign("TextRoot", "\"name\""),
-                    foreign("NumberRoot", "5"), foreign("NullRoot", "null"), foreign("NoName", "{\"rules\": {}}"),
-                    foreign("NumberForName", "{\"name\": 5}"), foreign("ObjectForName", "{\"name\": {}}")),
-    [](const auto &entry) { return entry.param.name; });
+TEST_F(HostileFiles, OfOddKindsHideNothingButThemselves) {
+    makeDirectories(hostile);
+    expectOnlyItselfHidden("directory", true);
+    ASSERT_EQ(mkfifo(hostile.c_str(), 0666), 0);
+    expectOnlyItselfHidden("FIFO", true);
+    for (const char *target : {"nowhere", "5.json", "/dev/zero"}) {
+        ASSERT_EQ(symlink(target, hostile.c_str()), 0);
+        expectOnlyItselfHidden(target, true);
+    }
+    store(std::string(250, 'x') + ".json", namedDocument("x"));
+    expectOnlyItselfHidden("name that is too long for a lock file", true);
+}
 
-class WronglyTypedProfile : public Store {};
-
-TEST_F(WronglyTypedProfile, IsReadAsFarAsItsValuesConvertAndHidesNoOther) {
+TEST_F(HostileFiles, WithWronglyTypedValuesAreReadAsFarAsTheyConvertAndHideNoOther) {
     const std::pair<std::string, bool> cases[] = {
         // members, can be converted
         {R"("rules": 5)", true},

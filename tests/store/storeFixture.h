@@ -19,6 +19,8 @@
 
 namespace veldtest {
 
+/// Where the tables of cases lie.
+inline const std::string caseDirectory = VELD_CASE_DIRECTORY;
 inline const std::string profileDirectory = "/usr/veld/etc/firewall.d/";
 inline const std::string lockDirectory = "/var/lock/firewall/";
 inline const std::string settingsPath = profileDirectory + "firewall_settings.json";
@@ -40,6 +42,8 @@ protected:
     /// The messages logged since the last call, as "file.cpp text" when they have the form "file.cpp:line text" and
     /// error priority, else marked as odd.
     std::vector<std::string> takeErrors();
+    /// The last of them, empty when there is none.
+    std::string takeLastError();
     std::vector<std::string> names();
 
     SystemLog log;
