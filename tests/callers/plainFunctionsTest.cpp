@@ -140,7 +140,7 @@ TEST_F(PlainFunctions, NullIsRefusedAndNoExceptionReachesAProgramThatCannotCatch
     }
     EXPECT_EQ(VLIBFwServRemoveRec(nullptr), -1);
     EXPECT_EQ(VLIBFwChangeAdatper("eth0", nullptr, 1), -1);
-    EXPECT_EQ(VLIBFwChangeAdatper(nullptr, "eth0", 1), -1);
+    EXPECT_EQ(VLIBFwChangeAdatper(nullptr, nullptr, 1), -1);
     EXPECT_EQ(VLIBCErrGet(), 0);
     EXPECT_THAT(log.messages(), IsEmpty());
     writeFile(profileDirectory + "1.json", R"({"name": "a", "rules": {"eth0": [{"policy": {}}]}})");

@@ -18,7 +18,8 @@ Json::Value rewritten(const Json::Value &document) {
 
 TEST(ProfileCodec, RuleMembersAreReadLenientlyWrittenInFullAndNumberedByPosition) {
     for (const auto &row : readCases(caseDirectory + "ruleDocuments.cases", 2)) {
-        Json::Value document, expected = json(readFile(caseDirectory + "emptyRule.json"));
+        Json::Value document = json("{'rules': {'eth0': [{}]}}"),
+                    expected = json(readFile(caseDirectory + "emptyRule.json"));
         document["rules"]["eth0"][1] = json(row[0]);
         const Json::Value changes = json(row[1]);
         for (const std::string &name : changes.getMemberNames())

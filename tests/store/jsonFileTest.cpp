@@ -21,15 +21,16 @@ mode_t modeOf(const std::string &path) {
 TEST_F(JsonFile, DocumentIsStyledTextAndKeepsThePermissionsOfTheOldFile) {
     const mode_t oldMask = umask(0);
     const std::string path = profileDirectory + "1.json";
-    store("1.json.tmp", std::string(10000, 'x'));  // left by a killed process
     ASSERT_TRUE(FW::jsonFileDump(json("{'b': [1, 'x'], 'a': null}"), path));
     EXPECT_EQ(readFile(path), "{\n   \"a\" : null,\n   \"b\" : [ 1, \"x\" ]\n}\n");
     EXPECT_EQ(modeOf(path), S_IFREG | 0666u);
     EXPECT_EQ(modeOf(lockDirectory), S_IFDIR | 0770u);
     EXPECT_EQ(modeOf(lockDirectory + "1.json.lock"), S_IFREG | 0660u);
     chmod(path.c_str(), 0600);
+    store("1.json.tmp", std::string(10000, 'x'));  // left by a killed process
     ASSERT_TRUE(FW::jsonFileDump(json("{}"), path));
     EXPECT_EQ(modeOf(path), S_IFREG | 0600u);
+    EXPECT_EQ(readFile(path), "{}\n");
     EXPECT_THAT(listDirectory(profileDirectory), ElementsAre("1.json"));
     umask(oldMask);
 }
