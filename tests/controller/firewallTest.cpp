@@ -2,11 +2,11 @@
 // What tests of the controller start from.
 #include "firewallTest.h"
 
-#include <fcntl.h>
 #include <json/json.h>
 #include <syslog.h>
-#include <unistd.h>
 
+#include <boost/interprocess/sync/file_lock.hpp>
+#include <regex>
 #include <sstream>
 #include <stdexcept>
 
@@ -20,24 +20,19 @@ constexpr const char *HOOK_RUNS = "/run/hook-runs";
 }  // namespace
 
 FirewallTest::FirewallTest() {
-    for (const char *left :
-         {"/usr/veld/etc", MODULE_STATE, HOOK_RUNS, EXEC_LOCK, "/run/hook-daemon", "/usr/share/xt_geoip"})
-        removeAll(left);
     writeFile(PROFILE, R"({"name": "default"})");
-    writeFile(MODULE_LIST, "KERNEL_MODULES_CORE=\"no_such_core.ko\"\n"
-                           "KERNEL_MODULES_COMMON=\"no_such_common.ko\"\n"
-                           "KERNEL_MODULES_NAT=\"no_such_nat.ko\"\n"
-                           "IPV6_MODULES=\"no_such_ipv6.ko\"\n");
+    writeFile(MODULE_LIST, "KERNEL_MODULES_CORE=no_such_core.ko\nKERNEL_MODULES_COMMON=no_such_common.ko\n"
+                           "KERNEL_MODULES_NAT=no_such_nat.ko\nIPV6_MODULES=no_such_ipv6.ko\n");
     writeFile("/etc/services", "discard 9/tcp\n");
     writeFile("/usr/veld/sbin/veldnetdtool", "#!/bin/sh\nprintf %s \"$2\"\n", 0755);
-    storeRules({});
 }
 
-void FirewallTest::storeRules(const std::vector<FW::FWRULE> &rules) {
+void FirewallTest::storeProfile(const std::map<std::string, std::vector<FW::FWRULE>> &rules,
+                                const std::map<std::string, FW::FW_POLICY> &policies) {
     FW::FWPROFILE profile;
     profile.name = "default";
-    if (!rules.empty())
-        profile.rules["global"] = rules;
+    profile.rules = rules;
+    profile.adapterPolicyMap = policies;
     if (!FW::VELDFW_PROFILE().profileSet("default", profile))
         throw std::runtime_error("no profile could be stored: " + log.text());
     log.clear();
@@ -51,39 +46,35 @@ bool FirewallTest::isSwitchedOn() {
     return settings["status"].asBool();
 }
 
-void FirewallTest::installNotingHooks() {
-    for (const std::string name : {"enable", "disable"})
-        writeFile("/usr/veld/etc/hooks.d/net/firewall_" + name + "/50-note",
-                  "#!/bin/sh\necho \"" + name + " $* $RESULT\" >> " + HOOK_RUNS + "\n", 0755);
+void FirewallTest::installHook(const std::string &action, const std::string &name, const std::string &script) {
+    writeFile("/usr/veld/etc/hooks.d/net/firewall_" + action + "/" + name, "#!/bin/sh\n" + script + "\n", 0755);
 }
 
-std::vector<std::string> FirewallTest::hookRuns() {
+void FirewallTest::installNotingHooks() {
+    for (const std::string action : {"enable", "disable"})
+        installHook(action, "50-note", "echo \"" + action + " $* $RESULT\" >> " + HOOK_RUNS);
+}
+
+std::vector<std::string> FirewallTest::takeHookRuns() {
     std::vector<std::string> runs;
     std::istringstream lines(pathExists(HOOK_RUNS) ? readFile(HOOK_RUNS) : "");
     for (std::string line; std::getline(lines, line);)
         runs.push_back(line);
+    removeAll(HOOK_RUNS);
     return runs;
 }
 
 bool FirewallTest::execLockIsFree() {
-    const int file = open(EXEC_LOCK, O_RDWR | O_CREAT | O_CLOEXEC, 0600);
-    struct flock whole {};
-    whole.l_type = F_WRLCK;
-    whole.l_whence = SEEK_SET;
-    const bool isFree = fcntl(file, F_OFD_SETLK, &whole) == 0;
-    close(file);
-    return isFree;
+    return boost::interprocess::file_lock(EXEC_LOCK).try_lock();
 }
 
 std::vector<std::string> FirewallTest::errors() {
+    static const std::regex own("((?:veldFW|fwHook|fwIptables|veldIptablesModule|fwGeoip)\\.cpp):[0-9]+( [^]*)");
     std::vector<std::string> texts;
+    std::smatch parts;
     for (const LogMessage &message : log.messages()) {
-        const std::string source = message.text.substr(0, message.text.find(':'));
-        for (const char *own :
-             {"veldFW.cpp", "fwHook.cpp", "fwIptables.cpp", "veldIptablesModule.cpp", "fwGeoip.cpp"}) {
-            if (source == own && message.priority == LOG_ERR)
-                texts.push_back(source + message.text.substr(message.text.find(' ')));
-        }
+        if (message.priority == LOG_ERR && std::regex_match(message.text, parts, own))
+            texts.push_back(parts.str(1) + parts.str(2));
     }
     return texts;
 }

@@ -26,14 +26,17 @@ class FirewallTest : public testing::Test {
 protected:
     FirewallTest();
 
-    /// Stores the rules as those of "global" in the profile "default".
-    void storeRules(const std::vector<FW::FWRULE> &rules);
+    /// Stores rules and default policies by adapter in the profile "default".
+    void storeProfile(const std::map<std::string, std::vector<FW::FWRULE>> &rules,
+                      const std::map<std::string, FW::FW_POLICY> &policies = {});
     /// The settings' "status", read from the file; throws when it is no boolean.
     static bool isSwitchedOn();
+    /// Installs an executable hook of "enable" or "disable".
+    static void installHook(const std::string &action, const std::string &name, const std::string &script);
     /// Installs hooks that note each run, for enabling and disabling.
     static void installNotingHooks();
-    /// The runs: "enable pre 0", "disable post -1".
-    static std::vector<std::string> hookRuns();
+    /// The runs noted since the last call: "enable pre 0", "disable post -1".
+    static std::vector<std::string> takeHookRuns();
     /// Whether another process could take the lock now.
     static bool execLockIsFree();
     /// Error messages of the library, without line numbers: "veldFW.cpp Failed to check status".

@@ -28,36 +28,10 @@ Lines operator+(Lines first, const Lines &second) {
     return first;
 }
 
-/// The commands of the profile with one rule that denies tcp port 23.
-Lines profileCommands(bool keepEstablished) {
-    Lines lines;
-    const auto preamble = [&](const std::string &program, bool ipv6) {
-        for (const std::string chain : {"INPUT_FIREWALL", "FORWARD_FIREWALL"}) {
-            const std::string append = "/sbin/" + program + " -A " + chain;
-            lines.push_back(append + " -i lo -j ACCEPT");
-            for (const std::string type : {"router-solicitation", "router-advertisement"})
-                if (ipv6)
-                    lines.push_back(append + " -s fe80::/10 -p icmpv6 --icmpv6-type " + type + " -j ACCEPT");
-            for (const std::string type : {"neighbour-solicitation", "neighbour-advertisement"})
-                if (ipv6)
-                    lines.push_back(append + " -p icmpv6 --icmpv6-type " + type + " -j ACCEPT");
-            if (ipv6)
-                lines.push_back(append + " -s fe80::/10 -p icmpv6 --icmpv6-type 137 -j ACCEPT");
-            if (keepEstablished)
-                lines.push_back(append + " -m state --state ESTABLISHED,RELATED -j ACCEPT");
-        }
-    };
-    preamble("iptables", false);
-    lines.emplace_back("/sbin/iptables -t filter -A FORWARD_FIREWALL -p tcp --dport 23 -j DROP");
-    lines.emplace_back("/sbin/iptables -t filter -A INPUT_FIREWALL -p tcp --dport 23 -j DROP");
-    preamble("ip6tables", true);
-    return lines;
-}
-
 class Lifecycle : public FirewallTest {
 protected:
     Lifecycle() {
-        storeRules({portRule("23", FW::FW_POLICY_DENY)});
+        storeProfile({{"global", {portRule("23", FW::FW_POLICY_DENY)}}});
         installNotingHooks();
     }
 
@@ -66,7 +40,20 @@ protected:
         ASSERT_TRUE(firewall.fwEnable()) << log.text();
         recorder.clear();
         log.clear();
-        removeAll("/run/hook-runs");
+        takeHookRuns();
+    }
+
+    /// Everything that applies the profile.
+    Lines applying(bool keepEstablished) {
+        Json::Value commands;
+        EXPECT_TRUE(firewall.fwIptablesRulesEnum("default", commands, keepEstablished));
+        Lines lines = SET_DROP + FLUSH;
+        for (const Json::Value &command : commands["v4"]["global"])
+            lines.push_back("/sbin/iptables " + command.asString());
+        for (const Json::Value &command : commands["v6"]["global"])
+            lines.push_back("/sbin/ip6tables " + command.asString());
+        EXPECT_EQ(lines.size(), keepEstablished ? 28u : 24u);
+        return lines + SET_ACCEPT;
     }
 
     CommandRecorder recorder;
@@ -74,47 +61,37 @@ protected:
 
 TEST_F(Lifecycle, EnableReloadAndDisableRunExactlyTheseCommands) {
     EXPECT_TRUE(firewall.fwEnable());
-    EXPECT_THAT(recorder.lines(), ElementsAreArray(SET_DROP + FLUSH + profileCommands(true) + SET_ACCEPT));
-    EXPECT_THAT(hookRuns(), ElementsAre("enable pre 0", "enable post 0"));
+    EXPECT_THAT(recorder.lines(), ElementsAreArray(applying(true)));
+    EXPECT_THAT(takeHookRuns(), ElementsAre("enable pre 0", "enable post 0"));
     EXPECT_TRUE(isSwitchedOn());
     EXPECT_EQ(readFile(MODULE_STATE), "firewall=\"yes\"\n");
-    for (const RecordedCommand &command : recorder.commands())
-        EXPECT_THAT(command.inheritedHandles, IsEmpty()) << command.line();
-
     recorder.clear();
     EXPECT_TRUE(firewall.fwReload(false));
-    EXPECT_THAT(recorder.lines(), ElementsAreArray(SET_DROP + FLUSH + profileCommands(false) + SET_ACCEPT));
-
+    EXPECT_THAT(recorder.lines(), ElementsAreArray(applying(false)));
     recorder.clear();
     EXPECT_TRUE(firewall.fwDisable());
+    EXPECT_TRUE(firewall.fwReload(true)) << "of a firewall that is off";
     EXPECT_THAT(recorder.lines(), ElementsAreArray(FLUSH));
-    EXPECT_THAT(hookRuns(), ElementsAre("enable pre 0", "enable post 0", "disable pre 0", "disable post 0"));
+    EXPECT_THAT(takeHookRuns(), ElementsAre("disable pre 0", "disable post 0"));
     EXPECT_FALSE(isSwitchedOn());
     EXPECT_EQ(readFile(MODULE_STATE), "firewall=\"no\"\n");
-
     recorder.clear();
-    EXPECT_TRUE(firewall.fwReload(true));
-    EXPECT_THAT(recorder.lines(), IsEmpty()) << "a reload of a firewall that is off";
-    EXPECT_EQ(readFile(MODULE_STATE), "firewall=\"no\"\n");
     EXPECT_TRUE(firewall.fwReset());
     EXPECT_THAT(recorder.lines(), ElementsAreArray(FLUSH));
     EXPECT_THAT(errors(), IsEmpty());
 }
 
-TEST_F(Lifecycle, HooksRunAroundAllCommands) {
+TEST_F(Lifecycle, HooksRunAroundAllCommandsAndNothingInheritsDescriptors) {
     const std::string hook = "/usr/veld/etc/hooks.d/net/firewall_enable/90-record";
     const CommandRecorder all({"/sbin/iptables", "/sbin/ip6tables", hook});
     EXPECT_TRUE(firewall.fwEnable());
-    const auto commands = all.commands();
-    ASSERT_EQ(commands.size(), 2 + (SET_DROP + FLUSH + profileCommands(true) + SET_ACCEPT).size());
-    EXPECT_EQ(commands.front().line(), hook + " pre");
-    EXPECT_EQ(commands.back().line(), hook + " post");
-    for (const RecordedCommand &command : commands)
+    EXPECT_THAT(all.lines(), ElementsAreArray(Lines{hook + " pre"} + applying(true) + Lines{hook + " post"}));
+    for (const RecordedCommand &command : all.commands())
         EXPECT_THAT(command.inheritedHandles, IsEmpty()) << command.line();
 }
 
 TEST_F(Lifecycle, EveryCommandThatFailsLeavesADefinedState) {
-    const Lines whole = SET_DROP + FLUSH + profileCommands(true) + SET_ACCEPT;
+    const Lines whole = applying(true);
     const size_t listBegin = SET_DROP.size() + FLUSH.size();
     const size_t listEnd = whole.size() - SET_ACCEPT.size();
     for (size_t n = 1; n <= whole.size(); ++n) {
@@ -122,142 +99,82 @@ TEST_F(Lifecycle, EveryCommandThatFailsLeavesADefinedState) {
         ASSERT_TRUE(firewall.fwDisable());
         recorder.clear();
         log.clear();
-        removeAll("/run/hook-runs");
+        takeHookRuns();
         recorder.failAt(static_cast<unsigned>(n), 2, "refused");
         const bool outcome = firewall.fwEnable();
         const Lines reached(whole.begin(), whole.begin() + static_cast<std::ptrdiff_t>(n));
         EXPECT_THAT(errors(), Contains("veldFW.cpp Failed to execute \"" + whole[n - 1] + "\""));
         EXPECT_TRUE(execLockIsFree());
         if (n <= SET_DROP.size()) {
-            EXPECT_FALSE(outcome);
             EXPECT_TRUE(isSwitchedOn()) << "nothing was replaced yet";
             EXPECT_EQ(recorder.lines(), reached);
-            EXPECT_THAT(hookRuns(), ElementsAre("enable pre 0", "enable post -1"));
+            EXPECT_THAT(takeHookRuns(), ElementsAre("enable pre 0", "enable post -1"));
             EXPECT_THAT(errors(), Contains("veldFW.cpp Failed to fwExec() to set default drop."));
         } else if (n <= listBegin) {
-            EXPECT_TRUE(outcome) << "a chain that cannot be flushed stops nothing";
-            EXPECT_TRUE(isSwitchedOn());
+            EXPECT_TRUE(isSwitchedOn()) << "a chain that cannot be flushed stops nothing";
             EXPECT_EQ(recorder.lines(), whole);
-            EXPECT_THAT(hookRuns(), ElementsAre("enable pre 0", "enable post 0"));
+            EXPECT_THAT(takeHookRuns(), ElementsAre("enable pre 0", "enable post 0"));
         } else {
             const bool inList = n <= listEnd;
-            EXPECT_FALSE(outcome);
             EXPECT_FALSE(isSwitchedOn());
             EXPECT_EQ(recorder.lines(), reached + FLUSH + (inList ? SET_ACCEPT : Lines()));
-            EXPECT_THAT(hookRuns(), ElementsAre("enable pre 0", "disable pre 0", "disable post 0", "enable post -1"));
+            EXPECT_THAT(takeHookRuns(),
+                        ElementsAre("enable pre 0", "disable pre 0", "disable post 0", "enable post -1"));
             EXPECT_THAT(errors(), Contains(inList ? "veldFW.cpp Failed to fwExec() so disable firewall"
                                                   : "veldFW.cpp Failed to fwExec() to set default accept."));
             EXPECT_EQ(readFile(MODULE_STATE), "firewall=\"no\"\n");
         }
-        if (!outcome) {
-            EXPECT_EQ(errors().back(), "veldFW.cpp Failed to apply firewall rules");
-        }
+        EXPECT_EQ(outcome, n > SET_DROP.size() && n <= listBegin);
+        EXPECT_EQ(errors().back() == "veldFW.cpp Failed to apply firewall rules", !outcome);
     }
 }
 
-TEST_F(Lifecycle, ProfileThatCannotBeConvertedRestoresAcceptAndPassesTheError) {
+TEST_F(Lifecycle, ProfileThatCannotBeAppliedRestoresAcceptAndTheFirewallStaysOn) {
     switchOn();
-    writeFile(PROFILE, R"({"name": "default", "rules": {"global": [{"policy": {}}]}})");
-    EXPECT_THROW(firewall.fwReload(true), Json::Exception);
-    EXPECT_THAT(recorder.lines(), ElementsAreArray(SET_DROP + FLUSH + SET_ACCEPT));
-    EXPECT_TRUE(execLockIsFree());
-    recorder.clear();
+    struct Row {
+        const char *active;
+        const char *rulePolicy;
+        const char *error;  ///< the last; null: an exception of the conversion passes
+    };
+    const Row rows[] = {
+        {R"({"status": true})", "1", "veldFW.cpp Failed to fwProfileConfigGet()"},
+        {R"({"status": true, "profile": "gone"})", "1", "veldFW.cpp Failed to fwIptablesRulesEnum()"},
+        {R"({"status": true, "profile": "default"})", "9", "veldFW.cpp Failed to fwIptablesRulesEnum()"},
+        {R"({"status": true, "profile": "default"})", "{}", nullptr},
+    };
+    for (const Row &row : rows) {
+        SCOPED_TRACE(std::string(row.active) + ", policy " + row.rulePolicy);
+        writeFile(SETTINGS, row.active);
+        writeFile(PROFILE, R"({"name": "default", "rules": {"global": [{"policy": )" + std::string(row.rulePolicy) +
+                               R"(, "enable": true}]}})");
+        recorder.clear();
+        log.clear();
+        if (row.error == nullptr) {
+            EXPECT_THROW(firewall.fwReload(true), Json::Exception);
+        } else {
+            EXPECT_FALSE(firewall.fwReload(true));
+            ASSERT_THAT(errors(), Contains(row.error));
+        }
+        EXPECT_THAT(recorder.lines(), ElementsAreArray(SET_DROP + FLUSH + SET_ACCEPT));
+        EXPECT_TRUE(isSwitchedOn());
+        EXPECT_TRUE(execLockIsFree());
+    }
     EXPECT_THROW(firewall.fwEnable(), Json::Exception);
-    EXPECT_THAT(recorder.lines(), ElementsAreArray(SET_DROP + FLUSH + SET_ACCEPT));
-    EXPECT_THAT(hookRuns(), ElementsAre("enable pre 0", "enable post -1"));
-    EXPECT_TRUE(execLockIsFree());
-    EXPECT_TRUE(isSwitchedOn());
+    EXPECT_THAT(takeHookRuns(), ElementsAre("enable pre 0", "enable post -1"));
 }
-
-struct BrokenStore {
-    const char *name;
-    std::string settings;
-    FW::FW_POLICY policy;  ///< of the rule in "default"
-    std::vector<std::string> errors;
-};
-
-class BrokenProfile : public Lifecycle, public testing::WithParamInterface<BrokenStore> {};
-
-TEST_P(BrokenProfile, IsNotAppliedAndTheFirewallStaysOn) {
-    switchOn();
-    storeRules({portRule("23", GetParam().policy)});
-    writeFile(SETTINGS, GetParam().settings);
-    EXPECT_FALSE(firewall.fwReload(true));
-    EXPECT_THAT(recorder.lines(), ElementsAreArray(SET_DROP + FLUSH + SET_ACCEPT));
-    EXPECT_EQ(errors(), GetParam().errors);
-    EXPECT_TRUE(isSwitchedOn());
-    EXPECT_THAT(hookRuns(), IsEmpty());
-    EXPECT_TRUE(execLockIsFree());
-}
-
-INSTANTIATE_TEST_SUITE_P(
-    Case, BrokenProfile,
-    testing::Values(
-        BrokenStore{"NoActiveProfile",
-                    R"({"status": true})",
-                    FW::FW_POLICY_DENY,
-                    {"veldFW.cpp There are no key: profile in config", "veldFW.cpp Failed to fwProfileConfigGet()"}},
-        BrokenStore{"UnknownProfile",
-                    R"({"status": true, "profile": "gone"})",
-                    FW::FW_POLICY_DENY,
-                    {"veldFW.cpp Failed to profileGet(gone)", "veldFW.cpp Failed to fwIptablesRulesEnum()"}},
-        BrokenStore{"UnknownPolicy",
-                    R"({"status": true, "profile": "default"})",
-                    static_cast<FW::FW_POLICY>(9),
-                    {"fwIptables.cpp Unknown policy 9", "fwIptables.cpp Failed to policyToIptablesArg()",
-                     "veldFW.cpp Failed to fwRulesToIptablesRules()", "veldFW.cpp Failed to fwIptablesRulesEnum()"}}),
-    [](const auto &entry) { return entry.param.name; });
 
 TEST_F(Lifecycle, SettingsThatCannotBeReadStopEverySwitch) {
     switchOn();
     writeFile(SETTINGS, "{ broken");
     EXPECT_FALSE(firewall.fwReload(true));
-    EXPECT_THAT(errors(), ElementsAre("veldFW.cpp Falied to configGet()", "veldFW.cpp Failed to check status"));
-    log.clear();
     EXPECT_FALSE(firewall.fwEnable());
     EXPECT_THAT(recorder.lines(), IsEmpty());
-    EXPECT_THAT(errors(), ElementsAre("veldFW.cpp Falied to config.configGet()", "veldFW.cpp Falied to configSet()"));
-    EXPECT_THAT(hookRuns(), ElementsAre("enable pre 0", "enable post -1"));
-    removeAll("/run/hook-runs");
+    EXPECT_THAT(errors(), ElementsAre("veldFW.cpp Falied to configGet()", "veldFW.cpp Failed to check status",
+                                      "veldFW.cpp Falied to config.configGet()", "veldFW.cpp Falied to configSet()"));
     EXPECT_FALSE(firewall.fwDisable());
     EXPECT_THAT(recorder.lines(), ElementsAreArray(FLUSH));
-    EXPECT_THAT(hookRuns(), ElementsAre("disable pre 0", "disable post -1"));
+    EXPECT_THAT(takeHookRuns(), ElementsAre("enable pre 0", "enable post -1", "disable pre 0", "disable post -1"));
     EXPECT_TRUE(execLockIsFree());
-}
-
-TEST_F(Lifecycle, WithoutTheModuleListNothingIsTouched) {
-    removeAll(MODULE_LIST);
-    EXPECT_FALSE(firewall.fwEnable());
-    EXPECT_THAT(hookRuns(), IsEmpty());
-    EXPECT_FALSE(pathExists(SETTINGS));
-    EXPECT_THAT(
-        errors(),
-        ElementsAre("veldIptablesModule.cpp Failed to get key KERNEL_MODULES_CORE from " + std::string(MODULE_LIST),
-                    "veldIptablesModule.cpp Failed to coreCommonModuleLoad()",
-                    "veldFW.cpp Failed to iptablesCoreModLoad", "veldFW.cpp Failed to firewallModLoad()"));
-    writeFile(SETTINGS, R"({"status": true, "profile": "default"})");
-    EXPECT_FALSE(firewall.fwReload(true));
-    EXPECT_THAT(recorder.lines(), IsEmpty());
-    EXPECT_TRUE(execLockIsFree());
-}
-
-TEST_F(Lifecycle, LoadedModulesAreLoadedOnce) {
-    switchOn();
-    removeAll(MODULE_LIST);
-    EXPECT_TRUE(firewall.fwReload(true)) << "the state file says that they are loaded";
-    EXPECT_TRUE(firewall.fwDisable()) << "a failure to unload stops nothing";
-    EXPECT_THAT(errors(), Contains("veldFW.cpp Failed to iptablesCoreModLoad"));
-    EXPECT_FALSE(isSwitchedOn());
-}
-
-TEST_F(Lifecycle, FlushGoesOnPastFailures) {
-    recorder.failMatching("/sbin/iptables -F", 1, "refused");
-    EXPECT_FALSE(firewall.fwClear());
-    EXPECT_EQ(recorder.lines(), FLUSH);
-    EXPECT_THAT(errors(), ElementsAre("veldFW.cpp Failed to execute /sbin/iptables",
-                                      "veldFW.cpp Failed to execute \"/sbin/iptables -F INPUT_FIREWALL\"",
-                                      "veldFW.cpp Failed to execute /sbin/iptables",
-                                      "veldFW.cpp Failed to execute \"/sbin/iptables -F FORWARD_FIREWALL\""));
 }
 
 }  // namespace

@@ -8,15 +8,18 @@
 #include "veld/core.h"
 
 #include <fcntl.h>
-#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
+#include <syslog.h>
 #include <unistd.h>
 
-#include <algorithm>
+#include <chrono>
 #include <csignal>
+#include <cstring>
+#include <fstream>
 
 using namespace veldtest;
-using testing::HasSubstr;
 
 namespace {
 
@@ -25,19 +28,15 @@ int runShell(const std::string &script, int wait = 1) {
     return VLIBCExecv("/bin/sh", const_cast<char *const *>(arguments), wait);
 }
 
-/// A program at `path` that notes each run in `path`.runs, runs `script` with the number of the run in $n.
-void installCounting(const std::string &path, const std::string &script) {
+/// Runs a program at `path` that notes each run, and has the number of the run in $n.
+int runCounting(const std::string &path, const std::string &script, std::chrono::milliseconds busyTime) {
     writeFile(path, "#!/bin/sh\necho run >> " + path + ".runs\nn=$(wc -l < " + path + ".runs)\n" + script + "\n", 0755);
+    const char *const arguments[] = {path.c_str(), nullptr};
+    return veld::runProgram(path.c_str(), const_cast<char *const *>(arguments), busyTime);
 }
 
 size_t runsOf(const std::string &path) {
-    const std::string runs = readFile(path + ".runs");
-    return static_cast<size_t>(std::count(runs.begin(), runs.end(), '\n'));
-}
-
-int runCounting(const std::string &path, std::chrono::milliseconds busyTime) {
-    const char *const arguments[] = {path.c_str(), nullptr};
-    return veld::runProgram(path.c_str(), const_cast<char *const *>(arguments), busyTime);
+    return readFile(path + ".runs").size() / strlen("run\n");
 }
 
 TEST(Exec, ResultIsZeroOnlyForExitStatusZeroAndTheLogSaysWhy) {
@@ -47,42 +46,33 @@ TEST(Exec, ResultIsZeroOnlyForExitStatusZeroAndTheLogSaysWhy) {
     EXPECT_EQ(runShell("echo 'no such chain' >&2; printf 'bad\\001byte' >&2; exit 3"), -1);
     EXPECT_EQ(runShell("kill -9 $$"), -1);
     const char *const missing[] = {"x", "-A", "INPUT", nullptr};
-    EXPECT_EQ(VLIBCExecv("/no/such/program", const_cast<char *const *>(missing), 1), -1);
+    for (const int wait : {0, 1})
+        EXPECT_EQ(VLIBCExecv("/no/such/program", const_cast<char *const *>(missing), wait), -1);
     const std::string command = "/bin/sh -c echo 'no such chain' >&2; printf 'bad\\001byte' >&2; exit 3: ";
-    EXPECT_TRUE(log.contains(command + "no such chain")) << log.text();
-    EXPECT_TRUE(log.contains(command + "bad?byte")) << log.text();
-    EXPECT_TRUE(log.contains(command + "exited with status 3")) << log.text();
-    EXPECT_TRUE(log.contains("was killed by signal 9 (KILL)")) << log.text();
-    EXPECT_TRUE(log.contains("/no/such/program -A INPUT: cannot be started: No such file or directory")) << log.text();
-    for (const LogMessage &message : log.messages())
-        EXPECT_EQ(message.priority, 3) << message.text;
+    for (const std::string &reason :
+         {command + "no such chain", command + "bad?byte", command + "exited with status 3",
+          std::string("was killed by signal 9 (KILL)"),
+          std::string("/no/such/program -A INPUT: cannot be started: No such file or directory")})
+        EXPECT_TRUE(log.contains(reason)) << reason << "\n" << log.text();
+    log.clear();
+    EXPECT_EQ(runShell("echo deprecated >&2"), 0);
+    ASSERT_EQ(log.count(": deprecated"), 1U) << log.text();
+    EXPECT_EQ(log.messages().at(0).priority, LOG_WARNING) << "error output of a success";
     EXPECT_EQ(VLIBCExecv(nullptr, const_cast<char *const *>(missing), 1), -1);
     EXPECT_EQ(VLIBCExecv("/bin/true", nullptr, 1), -1);
 }
 
-TEST(Exec, ErrorOutputOfASuccessIsAWarning) {
-    SystemLog log;
-    EXPECT_EQ(runShell("echo deprecated >&2"), 0);
-    ASSERT_EQ(log.messages().size(), 1U) << log.text();
-    EXPECT_EQ(log.messages()[0].priority, 4);
-    EXPECT_THAT(log.messages()[0].text, HasSubstr(": deprecated"));
-}
-
 TEST(Exec, TenMegabytesOfErrorOutputNeitherBlockNorFloodTheLog) {
     SystemLog log;
-    EXPECT_EQ(
-        runShell("yes 0123456789012345678901234567890123456789012345678901234567890 | head -c 10485760 >&2; exit 5"),
-        -1);
+    EXPECT_EQ(runShell("yes 0123456789012345678901234567890 | head -c 10485760 >&2; exit 5"), -1);
     EXPECT_TRUE(log.contains("exited with status 5")) << log.text();
     EXPECT_TRUE(log.contains("(10420224 more bytes of standard error are left out)"));
-    EXPECT_LT(log.messages().size(), 1200U);
+    EXPECT_LT(log.messages().size(), 2200U);
 }
 
 TEST(Exec, ReturnsWhileADaemonStillHoldsStandardError) {
     EXPECT_EQ(runShell("sleep 1000 & echo $! > /run/daemon; exit 0"), 0);
-    const pid_t daemon = std::stoi(readFile("/run/daemon"));
-    EXPECT_EQ(kill(daemon, 0), 0) << "the daemon had ended, so that nothing was shown";
-    kill(daemon, SIGKILL);
+    EXPECT_EQ(kill(std::stoi(readFile("/run/daemon")), SIGKILL), 0) << "it had ended, so that nothing was shown";
 }
 
 TEST(Exec, ProgramInheritsNoDescriptorSignalMaskOrDisposition) {
@@ -93,10 +83,9 @@ TEST(Exec, ProgramInheritsNoDescriptorSignalMaskOrDisposition) {
     EXPECT_NE(fcntl(lock, F_GETFD) & FD_CLOEXEC, 0);
     const char *const arguments[] = {"/sbin/iptables", "-L", nullptr};
     EXPECT_EQ(VLIBCExecv("/sbin/iptables", const_cast<char *const *>(arguments), 1), 0);
-    ASSERT_EQ(recorder.commands().size(), 1U);
-    EXPECT_TRUE(recorder.commands()[0].inheritedHandles.empty());
+    EXPECT_TRUE(recorder.commands().at(0).inheritedHandles.empty());
     close(plain);
-    EXPECT_NE(VLIBCFileUnlockByFile(lock), 0);
+    VLIBCFileUnlockByFile(lock);
 
     sigset_t usr1;
     sigemptyset(&usr1);
@@ -113,7 +102,7 @@ TEST(Exec, ProgramInheritsNoDescriptorSignalMaskOrDisposition) {
     EXPECT_EQ(readFile("/run/streams"), "/dev/null\n/dev/null\n");
 }
 
-TEST(Exec, CallerWithoutStandardStreamsLosesNothing) {
+TEST(Exec, CallerWithoutStandardStreamsOrExitStatusesLearnsWhatHappened) {
     SystemLog log;
     EXPECT_EQ(runInChild([] {
                   for (const int stream : {0, 1, 2})
@@ -123,34 +112,25 @@ TEST(Exec, CallerWithoutStandardStreamsLosesNothing) {
               0);
     EXPECT_TRUE(log.contains(": reason")) << log.text();
     EXPECT_TRUE(log.contains("exited with status 7")) << log.text();
-}
-
-TEST(Exec, LostExitStatusIsAFailureThatNamesItsCause) {
-    SystemLog log;
     EXPECT_EQ(runInChild([] {
                   signal(SIGCHLD, SIG_IGN);
                   return runShell("exit 0") == -1 ? 0 : 1;
               }),
               0);
-    EXPECT_TRUE(log.contains("its exit status is lost: No child processes (does the calling program ignore SIGCHLD?)"))
-        << log.text();
+    EXPECT_TRUE(log.contains("its exit status is lost: No child processes")) << log.text();
 }
 
 TEST(Exec, BusyTablesAreTriedAgainUntilTheyAreFree) {
     SystemLog log;
-    installCounting("/run/ip6tables-restore", "[ $n -ge 3 ] || { echo locked >&2; exit 4; }");
-    EXPECT_EQ(runCounting("/run/ip6tables-restore", std::chrono::seconds(10)), 0);
+    using namespace std::chrono_literals;
+    EXPECT_EQ(runCounting("/run/ip6tables-restore", "[ $n -ge 3 ] || { echo locked >&2; exit 4; }", 10s), 0);
     EXPECT_EQ(runsOf("/run/ip6tables-restore"), 3U);
     EXPECT_FALSE(log.contains("locked"));
-
-    installCounting("/run/iptables", "echo locked >&2; exit 4");
-    EXPECT_EQ(runCounting("/run/iptables", std::chrono::milliseconds(60)), -1);
+    EXPECT_EQ(runCounting("/run/iptables", "echo locked >&2; exit 4", 60ms), -1);
     EXPECT_GT(runsOf("/run/iptables"), 1U);
     EXPECT_TRUE(log.contains("/run/iptables: locked")) << log.text();
     EXPECT_TRUE(log.contains("/run/iptables: exited with status 4 at every try")) << log.text();
-
-    installCounting("/run/other", "exit 4");
-    EXPECT_EQ(runCounting("/run/other", std::chrono::seconds(10)), -1);
+    EXPECT_EQ(runCounting("/run/other", "exit 4", 10s), -1);
     EXPECT_EQ(runsOf("/run/other"), 1U) << "status 4 means a lock for xtables programs only";
 }
 
@@ -160,23 +140,20 @@ TEST(Exec, ProgramThatIsNotWaitedForLeavesNoChild) {
     EXPECT_EQ(runShell("read line < /run/go; echo $line > /run/answer.tmp; mv /run/answer.tmp /run/answer", 0), 0);
     EXPECT_EQ(waitpid(-1, nullptr, 0), -1);
     EXPECT_EQ(errno, ECHILD);
-    const int go = open("/run/go", O_WRONLY);
-    ASSERT_EQ(write(go, "done\n", 5), 5);
-    close(go);
+    std::ofstream("/run/go") << "done\n";
     while (!pathExists("/run/answer"))
         usleep(1000);
     EXPECT_EQ(readFile("/run/answer"), "done\n");
-    const char *const missing[] = {"x", nullptr};
-    EXPECT_EQ(VLIBCExecv("/no/such/program", const_cast<char *const *>(missing), 0), -1);
 }
 
 TEST(Popen, ReadsFromAndWritesToAProgramAndTellsItsStatus) {
     SystemLog log;
-    FILE *reader = VLIBCPopen("/bin/sh", "r", "-c", "printf '%s' \"$1\"; echo why >&2; exit 6", "sh", "$HOME ; text",
-                              static_cast<char *>(nullptr));
+    char *const end = nullptr;
+    FILE *reader =
+        VLIBCPopen("/bin/sh", "r", "-c", "printf '%s' \"$1\"; echo why >&2; exit 6", "sh", "$HOME ; text", end);
     ASSERT_NE(reader, nullptr);
     // A second program must not hold the first one's pipe.
-    FILE *writer = VLIBCPopen("/bin/sh", "w", "-c", "cat > /run/written", static_cast<char *>(nullptr));
+    FILE *writer = VLIBCPopen("/bin/sh", "w", "-c", "cat > /run/written", end);
     ASSERT_NE(writer, nullptr);
     char line[64] = "";
     EXPECT_NE(fgets(line, sizeof line, reader), nullptr);
@@ -186,17 +163,9 @@ TEST(Popen, ReadsFromAndWritesToAProgramAndTellsItsStatus) {
     fputs("words", writer);
     EXPECT_EQ(VLIBCPclose(writer), 0);
     EXPECT_EQ(readFile("/run/written"), "words");
-}
-
-TEST(Popen, FailuresAreTold) {
-    EXPECT_EQ(VLIBCPopen("/no/such/program", "r", static_cast<char *>(nullptr)), nullptr);
-    EXPECT_EQ(VLIBCPopen("/bin/true", "rw", static_cast<char *>(nullptr)), nullptr);
-    FILE *killed = VLIBCPopen("/bin/sh", "r", "-c", "kill -9 $$", static_cast<char *>(nullptr));
-    ASSERT_NE(killed, nullptr);
-    EXPECT_EQ(VLIBCPclose(killed), -1);
-    FILE *foreign = fopen("/dev/null", "r");
-    EXPECT_EQ(VLIBCPclose(foreign), -1);
-    fclose(foreign);
+    EXPECT_EQ(VLIBCPopen("/no/such/program", "r", end), nullptr);
+    EXPECT_EQ(VLIBCPopen("/bin/true", "rw", end), nullptr);
+    EXPECT_EQ(VLIBCPclose(VLIBCPopen("/bin/sh", "r", "-c", "kill -9 $$", end)), -1);
 }
 
 }  // namespace

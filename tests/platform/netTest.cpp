@@ -60,54 +60,32 @@ void fillLink(Message &message, int index, const char *name, const std::string &
     mnl_attr_nest_end(message.get(), info);
 }
 
-TEST(RouteDump, LinkAndSitTunnelAreRead) {
+TEST(RouteDump, OnlyWholeSitTunnelsAreRead) {
     Message tunnel(RTM_NEWLINK);
     fillLink(tunnel, 7, "tun6in4", "sit", "192.0.2.1");
     auto link = veld::parseLink(*tunnel.get());
-    ASSERT_TRUE(link);
+    ASSERT_TRUE(link && link->sitLocal);
     EXPECT_EQ(link->index, 7);
     EXPECT_EQ(link->name, "tun6in4");
-    ASSERT_TRUE(link->sitLocal);
     EXPECT_EQ(link->sitLocal->s_addr, ip4("192.0.2.1").s_addr);
-
     for (const auto &[kind, local] : {std::pair("", ""), std::pair("ipip", "192.0.2.1"), std::pair("sit", "")}) {
         Message other(RTM_NEWLINK);
         fillLink(other, 8, "x", kind, local);
         link = veld::parseLink(*other.get());
-        ASSERT_TRUE(link) << kind;
-        EXPECT_FALSE(link->sitLocal) << kind;
+        EXPECT_TRUE(link && !link->sitLocal) << kind;
     }
-}
-
-TEST(RouteDump, MalformedAndForeignMessagesAreIgnored) {
-    Message full(RTM_NEWLINK);
-    fillLink(full, 7, "tun6in4", "sit", "192.0.2.1");
     // Cut at every (aligned) length: never a read beyond the end, never a tunnel made of half a message.
-    const std::vector<char> bytes(reinterpret_cast<char *>(full.get()),
-                                  reinterpret_cast<char *>(full.get()) + full->nlmsg_len);
-    for (size_t length = sizeof(nlmsghdr); length < bytes.size(); length += NLMSG_ALIGNTO) {
+    const auto *bytes = reinterpret_cast<const char *>(tunnel.get());
+    for (size_t length = sizeof(nlmsghdr); length < tunnel->nlmsg_len; length += NLMSG_ALIGNTO) {
         const std::unique_ptr<char[]> exact(new char[length]);
-        std::copy_n(bytes.begin(), length, exact.get());
+        std::copy_n(bytes, length, exact.get());
         auto *header = reinterpret_cast<nlmsghdr *>(exact.get());
         header->nlmsg_len = static_cast<__u32>(length);
-        const auto link = veld::parseLink(*header);
+        link = veld::parseLink(*header);
         EXPECT_FALSE(link && link->sitLocal) << length;
     }
-    full->nlmsg_type = RTM_DELLINK;
-    EXPECT_FALSE(veld::parseLink(*full.get()));
-
-    Message address(RTM_NEWADDR);
-    auto &header = address.put<ifaddrmsg>();
-    header.ifa_family = AF_INET;
-    header.ifa_index = 3;
-    EXPECT_FALSE(veld::parseAddress(*address.get())) << "no address in it";
-    mnl_attr_put_u32(address.get(), IFA_LOCAL, ip4("192.0.2.1").s_addr);
-    const auto parsed = veld::parseAddress(*address.get());
-    ASSERT_TRUE(parsed);
-    EXPECT_EQ(parsed->index, 3);
-    EXPECT_EQ(parsed->local.s_addr, ip4("192.0.2.1").s_addr);
-    header.ifa_family = AF_INET6;
-    EXPECT_FALSE(veld::parseAddress(*address.get()));
+    tunnel->nlmsg_type = RTM_DELLINK;
+    EXPECT_FALSE(veld::parseLink(*tunnel.get()));
 }
 
 TEST(TunnelChoice, TunnelMustEndAtAnAddressOfTheInterface) {
@@ -125,35 +103,23 @@ TEST(TunnelChoice, TunnelMustEndAtAnAddressOfTheInterface) {
         EXPECT_EQ(veld::ipv6RouterInterface(none, links, addresses), none);
 }
 
-TEST(NetworkTool, PrintsTheGivenNameWithoutATunnel) {
-    addDummyInterface("eth7");
-    for (const char *name : {"eth7", "unknown"}) {
-        const auto result = runProgram({VELD_NETDTOOL, "--get-ipv6-router-interface", name});
-        EXPECT_EQ(result.status, 0) << result.errors;
-        EXPECT_EQ(result.output, name);
-    }
-    for (const std::vector<std::string> &wrong :
-         {std::vector<std::string>{}, {"--get-ipv6-router-interface"}, {"--help", "x"}, {"a", "b", "c"}}) {
-        std::vector<std::string> command = wrong;
-        command.insert(command.begin(), VELD_NETDTOOL);
-        const auto result = runProgram(command);
-        EXPECT_EQ(result.status, 2);
-        EXPECT_EQ(result.output, "");
-        EXPECT_NE(result.errors, "");
-    }
-}
-
-TEST(NetworkTool, PrintsTheRealTunnelOfAnInterface) {
+TEST(NetworkTool, PrintsTheRealTunnelOfAnInterfaceOrTheGivenName) {
+    const auto ask = [](const std::string &name) {
+        return runChecked({VELD_NETDTOOL, "--get-ipv6-router-interface", name});
+    };
     addDummyInterface("eth7");
     addDummyInterface("eth8");
     addAddress("eth7", "192.0.2.1/24");
     addAddress("eth8", "198.51.100.1/24");
+    for (const char *name : {"eth7", "unknown"})
+        EXPECT_EQ(ask(name), name);
+    EXPECT_EQ(runProgram({VELD_NETDTOOL, "--help", "x"}).status, 2);
     const auto added =
         runProgram({"ip", "link", "add", "six0", "type", "sit", "local", "192.0.2.1", "remote", "192.0.2.2"});
     if (!added.succeeded())
         GTEST_SKIP() << "this kernel makes no 6in4 tunnel: " << added.errors;
-    EXPECT_EQ(runProgram({VELD_NETDTOOL, "--get-ipv6-router-interface", "eth7"}).output, "six0");
-    EXPECT_EQ(runProgram({VELD_NETDTOOL, "--get-ipv6-router-interface", "eth8"}).output, "eth8");
+    EXPECT_EQ(ask("eth7"), "six0");
+    EXPECT_EQ(ask("eth8"), "eth8");
 }
 
 TEST(Interfaces, AllButLoopbackInKernelOrderAndAtMostAsAsked) {

@@ -2,11 +2,14 @@
 // Another user's doings in a test.
 #pragma once
 
+#include "files.h"
 #include "processes.h"
 #include "sandbox.h"
 
+#include <fcntl.h>
 #include <grp.h>
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <functional>
@@ -22,6 +25,26 @@ inline int asStranger(const std::function<bool()> &action) {
             return 99;
         return action() ? 0 : 1;
     });
+}
+
+struct Planted {
+    const char *what;
+    std::function<bool()> plant;
+};
+
+/// What a stranger can put in the place of a file.
+inline std::vector<Planted> plantedThings(const std::string &path, const std::string &target, const std::string &text) {
+    return {{"file", [=] { return writeFile(path, text, 0666), true; }},
+            {"link", [=] { return symlink(target.c_str(), path.c_str()) == 0; }},
+            {"link to nothing", [=] { return symlink("/run/nothing", path.c_str()) == 0; }},
+            {"FIFO", [=] { return mkfifo(path.c_str(), 0666) == 0; }},
+            {"full directory", [=] { return makeDirectories(path + "/x"), true; }}};
+}
+
+/// Whether it is a file of this user.
+inline bool isOwnFile(const std::string &path) {
+    struct stat info {};
+    return lstat(path.c_str(), &info) == 0 && S_ISREG(info.st_mode) && info.st_uid == geteuid();
 }
 
 }  // namespace veldtest

@@ -2,7 +2,6 @@
 // The registry of services: definition files, the services database, and broken or hostile files.
 #include "files.h"
 #include "serviceconf/serviceDefinition.h"
-#include "serviceconf/servicesDatabase.h"
 #include "systemLog.h"
 #include "veld/serviceconf.h"
 
@@ -50,46 +49,28 @@ private:
     VELDFWSERVICE_HANDLE handle_ = nullptr;
 };
 
-TEST(ServiceDefinition, GoodOnesAreRead) {
-    veld::ServiceDefinition service;
-    std::string reason;
-    ASSERT_TRUE(veld::parseServiceDefinition(definition("ssh", "\"22\", \"1000-2000\""), service, reason)) << reason;
-    EXPECT_EQ(service.name, "ssh");
-    EXPECT_TRUE(service.enabled);
-    EXPECT_EQ(service.source.protocol, VELDFW_SERVICE_UDP);
-    EXPECT_EQ(service.destination.ports, (std::vector<std::string>{"22", "1000-2000"}));
-    EXPECT_EQ(veld::protocolKind(service), VELDFW_SERVICE_TCP);
-    ASSERT_TRUE(veld::parseServiceDefinition(definition("a", "", ", \"enabled\": false"), service, reason)) << reason;
-    EXPECT_FALSE(service.enabled);
-    EXPECT_EQ(veld::protocolKind(service), VELDFW_SERVICE_UDP) << "that of the source, the destination being empty";
-    ASSERT_TRUE(veld::parseServiceDefinition(R"({"name":"p","destination":{"protocol":"icmp"}})", service, reason));
-    EXPECT_EQ(veld::protocolKind(service), VELDFW_SERVICE_ICMP);
-}
-
 TEST(ServiceDefinition, BadOnesAreRefusedWithAReason) {
-    const std::string bad[] = {"",
-                               "null",
-                               "[]",
-                               "\"ssh\"",
-                               "{}",
-                               "{",
-                               definition("ssh", "\"22\"") + "}",
-                               definition("", "\"22\""),
-                               definition("two words", "\"22\""),
-                               definition("a\\u0000b", "\"22\""),
-                               definition("ssh", "22"),
-                               definition("ssh", "null"),
-                               definition("ssh", "\"22\"", ", \"enabled\": 1"),
-                               R"({"name": 5, "destination": {"protocol": "tcp", "ports": ["22"]}})",
-                               R"({"name": "ssh"})",
-                               R"({"name": "ssh", "destination": {"protocol": "sctp", "ports": ["22"]}})",
-                               R"({"name": "ssh", "destination": {"protocol": 1, "ports": ["22"]}})",
-                               R"({"name": "ssh", "destination": {"protocol": "tcp", "ports": "22"}})",
-                               R"({"name": "ssh", "destination": []})",
-                               R"({"name": "ssh", "destination": {"protocol": "tcp", "ports": ["22"]}, "source": 7})",
-                               std::string(100000, '['),
-                               "{\"name\":" + std::string(100000, '['),
-                               std::string(100000, ' ')};
+    const std::string manyBrackets(100000, '[');
+    const std::string bad[] = {
+        "",
+        "[]",
+        "{}",
+        definition("ssh", "\"22\"") + "}",
+        definition("", "\"22\""),
+        definition("two words", "\"22\""),
+        definition("a\\u0000b", "\"22\""),
+        definition("ssh", "22"),
+        definition("ssh", "\"22\"", ", \"enabled\": 1"),
+        R"({"name": 5, "destination": {"protocol": "tcp", "ports": ["22"]}})",
+        R"({"name": "ssh"})",
+        R"({"name": "ssh", "destination": {"protocol": "sctp", "ports": ["22"]}})",
+        R"({"name": "ssh", "destination": {"protocol": 1, "ports": ["22"]}})",
+        R"({"name": "ssh", "destination": {"protocol": "tcp", "ports": "22"}})",
+        R"({"name": "ssh", "destination": []})",
+        R"({"name": "ssh", "destination": {"protocol": "tcp", "ports": ["22"]}, "source": 7})",
+        "{\"name\":" + manyBrackets,
+        std::string(100000, ' '),
+    };
     for (const std::string &text : bad) {
         veld::ServiceDefinition service;
         std::string reason;
@@ -102,41 +83,34 @@ TEST(ServiceDefinition, BadOnesAreRefusedWithAReason) {
         EXPECT_FALSE(veld::isPortEntry(port)) << port;
 }
 
-TEST(ServicesDatabase, EntriesOfOneNameAndPortBecomeOneService) {
-    const auto services = veld::definitionsFrom({{"domain", {"dns"}, 53, "tcp"},
-                                                 {"domain", {"dns"}, 53, "udp"},
-                                                 {"tftp", {}, 69, "udp"},
-                                                 {"split", {}, 100, "udp"},
-                                                 {"split", {}, 200, "tcp"},
-                                                 {"later", {"tftp"}, 300, "tcp"},
-                                                 {"sctponly", {}, 400, "sctp"},
-                                                 {"domain", {}, 5353, "tcp"}});
-    std::string text;
-    for (const auto &service : services)
-        text += service.name + " " + std::to_string(service.destination.protocol) + " " +
-                service.destination.ports.at(0) + "\n";
-    EXPECT_EQ(text, "dns 3 53\ndomain 3 53\nlater 1 300\nsplit 1 200\ntftp 2 69\n");
-}
-
-TEST(ServiceRegistry, DefinitionFilesWinOverTheDatabase) {
+TEST(ServiceRegistry, DefinitionFilesWinOverTheDatabaseWhoseEntriesAreJoined) {
     SystemLog log;
-    writeFile("/etc/services", "ssh 22/tcp\nhttp 80/tcp www\nhttp 80/udp www\nfinger 79/tcp\n");
-    writeFile(directory + "10-ssh.json", definition("ssh", "\"2222\""));
+    writeFile("/etc/services", "ssh 22/tcp\nhttp 80/tcp www\nhttp 80/udp www\nfinger 79/tcp\nsplit 100/udp\n"
+                               "split 200/tcp\nlater 300/tcp www\nsctponly 400/sctp\nhttp 8080/tcp\n");
+    writeFile(directory + "10-ssh.json", definition("ssh", "\"2222\", \"1000-2000\""));
     writeFile(directory + "20-finger.json", definition("finger", "\"79\"", ", \"enabled\": false"));
     writeFile(directory + "30-again.json", definition("ssh", "\"2223\""));
+    writeFile(directory + "40-ping.json", R"({"name":"ping","destination":{"protocol":"icmp"}})");
+    writeFile(directory + "50-empty.json", definition("empty", ""));
     const Registry registry;
-    EXPECT_EQ(registry.count, 4);
-    EXPECT_EQ(registry.text("ssh"), "1::2222");
-    EXPECT_EQ(registry.text("http"), "3::80");
-    EXPECT_EQ(registry.text("www"), "3::80");
-    EXPECT_EQ(registry.text("nonesuch"), "none");
+    EXPECT_EQ(registry.count, 8);
+    const std::pair<const char *, std::string> expected[] = {
+        {"ssh", "1::2222,1000-2000"},
+        {"http", "3::80"},
+        {"www", "3::80"},
+        {"split", "1::200"},
+        {"later", "1::300"},
+        {"sctponly", "none"},
+        {"ping", std::to_string(VELDFW_SERVICE_ICMP) + "::"},
+        {"empty", "2::"},  // that of the source, the destination being empty
+    };
+    for (const auto &[name, text] : expected)
+        EXPECT_EQ(registry.text(name), text) << name;
     ASSERT_NE(registry["finger"], nullptr);
     EXPECT_EQ(registry["finger"]->data, 0);
     EXPECT_NE(registry["http"]->data, 0);
     EXPECT_STREQ(registry["http"]->szName, "http");
-    EXPECT_TRUE(log.contains(directory.substr(0, directory.size() - 1) +
-                             "/30-again.json is skipped: an earlier file defines \"ssh\""))
-        << log.text();
+    EXPECT_TRUE(log.contains("/30-again.json is skipped: an earlier file defines \"ssh\"")) << log.text();
     EXPECT_EQ(log.messages().size(), 1U) << log.text();
 }
 
@@ -151,25 +125,20 @@ TEST(ServiceRegistry, HostileFilesAreNamedAndSkipped) {
     ASSERT_EQ(mkfifo((directory + "fifo.json").c_str(), 0644), 0);
     ASSERT_EQ(symlink("nowhere", (directory + "dangling.json").c_str()), 0);
     ASSERT_EQ(symlink("/dev/zero", (directory + "device.json").c_str()), 0);
-    writeFile(directory + "ignored.txt", definition("ignored", "\"1\""));
-    writeFile(directory + ".hidden.json", definition("hidden", "\"1\""));
-    const Registry registry;
-    EXPECT_EQ(registry.count, 1);
-    EXPECT_EQ(registry.text("good"), "1::1");
+    for (const char *ignored : {"ignored.txt", ".hidden.json"})
+        writeFile(directory + ignored, definition("ignored", "\"1\""));
+    {
+        const Registry registry;
+        EXPECT_EQ(registry.count, 1);
+        EXPECT_EQ(registry.text("good"), "1::1");
+    }
     for (const char *name : {"empty", "deep", "huge", "directory", "fifo", "dangling", "device"})
         EXPECT_EQ(log.count(std::string("/") + name + ".json is skipped: "), 1U) << name << log.text();
     EXPECT_EQ(log.messages().size(), 7U) << log.text();
-}
-
-TEST(ServiceRegistry, NothingDefinedIsAFailureWithoutAHandle) {
-    SystemLog log;
-    writeFile("/etc/services", "");
-    auto handle = reinterpret_cast<VELDFWSERVICE_HANDLE>(&log);
-    EXPECT_EQ(VELDFwServiceEnum(&handle), 0);
-    EXPECT_EQ(handle, nullptr);
-    EXPECT_EQ(VELDFWServiceFind(handle, "ssh"), nullptr);
-    VELDFwServiceFree(handle);
-    EXPECT_LT(VELDFwServiceEnum(nullptr), 0);
+    removeAll(directory);
+    const Registry nothing;
+    EXPECT_EQ(nothing.count, 0);
+    EXPECT_EQ(nothing.text("good"), "none");
 }
 
 }  // namespace

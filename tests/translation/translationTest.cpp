@@ -1,14 +1,18 @@
 // SPDX-License-Identifier: Apache-2.0
-// Every case in cases/ is a test; and what a case cannot show: caches, the overloads, steps called by themselves.
+// Every case in cases/ is a test; and what a case cannot show: what is remembered, steps called by themselves.
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <json/json.h>
 #include <syslog.h>
 
 #include <algorithm>
 #include <filesystem>
+#include <fstream>
+#include <functional>
+#include <optional>
+#include <sstream>
+#include <stdexcept>
 
-#include "caseFile.h"
-#include "caseSystem.h"
 #include "files.h"
 #include "network.h"
 #include "systemLog.h"
@@ -19,193 +23,239 @@ using testing::ElementsAre;
 
 namespace {
 
-constexpr const char *CHAINS[] = {"INPUT_FIREWALL", "FORWARD_FIREWALL"};
+using Words = std::vector<std::string>;
 
-std::vector<std::string> caseNames() {
-    std::vector<std::string> names;
-    for (const auto &entry : std::filesystem::directory_iterator(VELD_CASE_DIRECTORY)) {
-        if (entry.path().extension() == ".case")
-            names.push_back(entry.path().stem());
-    }
-    std::sort(names.begin(), names.end());
-    return names;
+// Prints the answer for the interface, or the interface itself, and notes its arguments.
+constexpr const char *TOOL = "/usr/veld/sbin/veldnetdtool";
+constexpr const char *TOOL_SCRIPT =
+    "#!/bin/sh\n"
+    "echo \"$*\" >> /run/tool-runs\n"
+    "[ -e \"/run/tool-answer.$2\" ] && exec printf %b \"$(cat \"/run/tool-answer.$2\")\"\n"
+    "printf %s \"$2\"\n";
+
+Words split(const std::string &text, char separator) {
+    Words pieces;
+    std::istringstream stream(text);
+    for (std::string piece; std::getline(stream, piece, separator);)
+        pieces.push_back(piece);
+    return pieces;
 }
 
-/// Puts the fixed commands without connection tracking, as the cases about the preamble spell them out, in front.
-void addPreamble(TranslationCase &wanted) {
-    std::vector<std::string> v4;
-    std::vector<std::string> v6;
-    for (const std::string chain : CHAINS) {
-        v4.push_back("-A " + chain + " -i lo -j ACCEPT");
-        v6.push_back("-A " + chain + " -i lo -j ACCEPT");
-        for (const std::string text :
-             {"-s fe80::/10 -p icmpv6 --icmpv6-type router-solicitation",
-              "-s fe80::/10 -p icmpv6 --icmpv6-type router-advertisement",
-              "-p icmpv6 --icmpv6-type neighbour-solicitation", "-p icmpv6 --icmpv6-type neighbour-advertisement",
-              "-s fe80::/10 -p icmpv6 --icmpv6-type 137"})
-            v6.push_back("-A " + chain + " " + text + " -j ACCEPT");
+std::pair<std::string, std::string> cut(const std::string &text, char separator) {
+    const size_t at = text.find(separator);
+    return at == std::string::npos ? std::pair(text, std::string())
+                                   : std::pair(text.substr(0, at), text.substr(at + 1));
+}
+
+FW::FWRULE parseRule(const Words &words) {
+    FW::FWRULE rule;
+    const std::map<std::string, int32_t *> numbers = {{"adapterDirect", &rule.adapterDirect},
+                                                      {"ipType", &rule.ipType},
+                                                      {"ipDirect", &rule.ipDirect},
+                                                      {"ipGroup", &rule.ipGroup},
+                                                      {"portDirect", &rule.portDirect},
+                                                      {"portGroup", &rule.portGroup},
+                                                      {"protocol", &rule.protocol}};
+    const std::map<std::string, std::function<void(const std::string &)>> others = {
+        {"enable", [&](const std::string &value) { rule.enable = value != "0"; }},
+        {"blLog", [&](const std::string &value) { rule.blLog = value != "0"; }},
+        {"policy", [&](const std::string &value) { rule.policy = static_cast<FW::FW_POLICY>(std::stoi(value)); }},
+        {"name", [&](const std::string &value) { rule.name = value; }},
+        {"table", [&](const std::string &value) { rule.table = value; }},
+        {"ipList", [&](const std::string &value) { rule.ipList = split(value, ','); }},
+        {"portList", [&](const std::string &value) { rule.portList = split(value, ','); }},
+        {"chainList", [&](const std::string &value) {
+             const Words chains = split(value, ',');
+             rule.chainList = {chains.begin(), chains.end()};
+         }}};
+    for (size_t i = 1; i < words.size(); ++i) {  // the first names the adapter
+        const auto [key, value] = cut(words[i], '=');
+        if (const auto number = numbers.find(key); number != numbers.end())
+            *number->second = std::stoi(value);
+        else
+            others.at(key)(value);
     }
-    for (auto [group, preamble] : {std::pair("v4 global", &v4), std::pair("v6 global", &v6)}) {
-        auto &commands = wanted.commands[group];
-        commands.insert(commands.begin(), preamble->begin(), preamble->end());
+    return rule;
+}
+
+void installService(const Words &words) {
+    Json::Value json;
+    json["name"] = words.at(0);
+    json["enabled"] = true;
+    for (size_t i = 1; i < words.size(); ++i) {
+        if (words[i] == "disabled") {
+            json["enabled"] = false;
+            continue;
+        }
+        const auto [side, service] = cut(words[i], '=');
+        const auto [protocol, ports] = cut(service, ':');
+        json[side]["protocol"] = protocol;
+        json[side]["ports"] = Json::Value(Json::arrayValue);
+        for (const std::string &port : split(ports, ','))
+            json[side]["ports"].append(port);
+    }
+    writeFile("/usr/veld/etc/services.d/" + words[0] + ".json", json.toStyledString());
+}
+
+/// A case that is read: the sandbox looks as it says, and this is the call and what must come out.
+struct TranslationCase {
+    /// Throws std::runtime_error that names file and line for what it does not know.
+    void read(const std::string &name);
+    void applyLine(const std::string &key, const std::string &rest);
+
+    bool keepEstablished = false;
+    std::optional<std::string> client;
+    FW::FWPROFILE profile;
+    bool fails = false;
+    Words log;                                    ///< "error fwIptables.cpp text", all in order
+    std::optional<Words> toolRuns;                ///< arguments of each run of the network tool
+    std::map<std::string, std::string> commands;  ///< "v4 eth0" to its indented lines
+};
+
+void TranslationCase::applyLine(const std::string &key, const std::string &rest) {
+    const Words words = split(rest, ' ');
+    const auto askedFor = [&] {
+        toolRuns.emplace();
+        for (const std::string &interface : words)
+            toolRuns->push_back("--get-ipv6-router-interface " + interface);
+    };
+    const std::map<std::string, std::function<void()>> lines = {
+        {"interfaces", [&] { std::for_each(words.begin(), words.end(), addDummyInterface); }},
+        {"pppoe", [&] { writeFile("/run/ppp-pppoe.pid", "4711\n" + rest + "\n"); }},
+        {"wireless", [&] { writeFile("/etc.defaults/veldinfo.conf", "support_wireless=\"yes\"\n"); }},
+        {"service", [&] { installService(words); }},
+        {"service-registry-empty", [&] { writeFile("/etc/services", ""); }},
+        {"geoip", [&] { writeFile("/usr/share/xt_geoip/" + words.at(0), std::string(std::stoul(words.at(1)), '\1')); }},
+        {"tunnel", [&] { writeFile("/run/tool-answer." + words.at(0), cut(rest, ' ').second); }},
+        {"network-tool-missing", [&] { removeAll(TOOL); }},
+        {"keep-established", [&] { keepEstablished = true; }},
+        {"client", [&] { client = rest; }},
+        {"rule", [&] { profile.rules[words.at(0)].push_back(parseRule(words)); }},
+        {"policy", [&] { profile.adapterPolicyMap[words.at(0)] = static_cast<FW::FW_POLICY>(std::stoi(words.at(1))); }},
+        {"fails", [&] { fails = true; }},
+        {"preamble-spelled-out", [&] { commands.clear(); }},
+        {"log", [&] { log.push_back(rest); }},
+        {"tool-asked", askedFor},
+        {"v4", [&] { commands["v4 " + rest]; }},
+        {"v6", [&] { commands["v6 " + rest]; }}};
+    lines.at(key)();
+}
+
+void TranslationCase::read(const std::string &name) {
+    std::ifstream file(std::string(VELD_CASE_DIRECTORY "/") + name);
+    if (!file)
+        throw std::runtime_error(name + ": cannot be opened");
+    std::string group;
+    int number = 0;
+    for (std::string line; std::getline(file, line);) {
+        ++number;
+        if (line.empty() || line.front() == '#')
+            continue;
+        try {
+            if (line.front() == ' ') {
+                commands.at(group) += line + "\n";
+                continue;
+            }
+            group = line;
+            const auto [key, rest] = cut(line, ' ');
+            applyLine(key, rest);
+        } catch (const std::logic_error &) {
+            throw std::runtime_error(name + ":" + std::to_string(number) + ": not understood: " + line);
+        }
     }
 }
 
-std::string toText(const std::map<std::string, std::vector<std::string>> &commands) {
+std::string toText(const std::map<std::string, std::string> &commands) {
     std::string text;
-    for (const auto &[group, lines] : commands) {
-        text += group + "\n";
-        for (const std::string &line : lines)
-            text += "    " + line + "\n";
-    }
+    for (const auto &[group, lines] : commands)
+        text += group + "\n" + lines;
     return text;
 }
 
 std::string toText(const Json::Value &cmdList) {
-    std::map<std::string, std::vector<std::string>> commands;
+    std::map<std::string, std::string> commands;
     for (const std::string &family : cmdList.getMemberNames()) {
         for (const std::string &group : cmdList[family].getMemberNames()) {
             for (const Json::Value &command : cmdList[family][group])
-                commands[family + " " + group].push_back(command.asString());
+                commands[family + " " + group] += "    " + command.asString() + "\n";
         }
     }
-    std::string text = toText(commands);
-    return text;
+    return toText(commands);
 }
 
 /// What the translation wrote, without line numbers.
-std::vector<std::string> libraryMessages(SystemLog &log) {
-    std::vector<std::string> texts;
+Words libraryMessages(SystemLog &log) {
+    Words texts;
     for (const LogMessage &message : log.messages()) {
-        const size_t colon = message.text.find(':');
-        const std::string source = message.text.substr(0, colon);
-        if (source != "fwIptables.cpp" && source != "fwGeoip.cpp")
-            continue;
-        const std::string text = message.text.substr(message.text.find(' ') + 1);
-        texts.push_back(std::string(message.priority == LOG_ERR ? "error" : "debug") + " " + source + " " + text);
+        const auto [source, text] = cut(message.text, ':');
+        if (source == "fwIptables.cpp" || source == "fwGeoip.cpp")
+            texts.push_back((message.priority == LOG_ERR ? "error " : "debug ") + source + " " + cut(text, ' ').second);
     }
     return texts;
 }
 
-class Translation : public testing::TestWithParam<std::string> {};
+class Translator : public testing::Test {
+protected:
+    Translator() {
+        // Names that the machine's own services database knows must not come in.
+        writeFile("/etc/services", "discard 9/tcp\n");
+        writeFile(TOOL, TOOL_SCRIPT, 0755);
+    }
+};
+
+class Translation : public Translator, public testing::WithParamInterface<std::string> {};
 
 TEST_P(Translation, GivesTheCommandsOfTheCase) {
-    TranslationCase wanted = readCase(std::string(VELD_CASE_DIRECTORY "/") + GetParam() + ".case");
-    if (!wanted.preambleSpelledOut)
-        addPreamble(wanted);
-    const CaseSystem system(wanted);
+    TranslationCase wanted;
+    wanted.read("preamble.commands");
+    wanted.read(GetParam() + ".case");
     SystemLog log;
     FW::VELDFW_IPTABLES_RULES translator;
     Json::Value cmdList;
     translator.jIptablesCmdInit(cmdList);
     const auto &[rules, policies] = std::tie(wanted.profile.rules, wanted.profile.adapterPolicyMap);
     const bool outcome =
-        wanted.hasClient
-            ? translator.fwRulesToIptablesRules(wanted.keepEstablished, rules, policies, cmdList, wanted.client)
+        wanted.client
+            ? translator.fwRulesToIptablesRules(wanted.keepEstablished, rules, policies, cmdList, *wanted.client)
             : translator.fwRulesToIptablesRules(wanted.keepEstablished, rules, policies, cmdList);
     EXPECT_EQ(outcome, !wanted.fails);
     EXPECT_EQ(toText(cmdList), toText(wanted.commands));
     EXPECT_EQ(libraryMessages(log), wanted.log) << log.text();
-    if (wanted.toolRunsGiven) {
-        std::vector<std::string> runs;
-        for (const std::string &interface : wanted.toolRuns)
-            runs.push_back("--get-ipv6-router-interface " + interface);
-        EXPECT_EQ(CaseSystem::toolRuns(), runs);
+    if (wanted.toolRuns) {
+        EXPECT_EQ(split(pathExists("/run/tool-runs") ? readFile("/run/tool-runs") : "", '\n'), *wanted.toolRuns);
     }
+}
+
+Words caseNames() {
+    Words names;
+    for (const auto &entry : std::filesystem::directory_iterator(VELD_CASE_DIRECTORY)) {
+        if (entry.path().extension() == ".case")
+            names.push_back(entry.path().stem());
+    }
+    return names;
 }
 
 INSTANTIATE_TEST_SUITE_P(Case, Translation, testing::ValuesIn(caseNames()),
                          [](const auto &entry) { return entry.param; });
 
-TEST(Translator, TwoRunsOnOneListGiveEverythingTwice) {
-    const CaseSystem system({});
+TEST_F(Translator, RemembersWhatIsThereAndAsksAgainForWhatIsNot) {
     FW::VELDFW_IPTABLES_RULES translator;
-    Json::Value cmdList;
-    translator.jIptablesCmdInit(cmdList);
-    for (int run = 1; run <= 2; ++run) {
-        EXPECT_TRUE(translator.fwRulesToIptablesRules(true, {}, {}, cmdList));
-        EXPECT_EQ(cmdList["v4"]["global"].size(), 4u * static_cast<unsigned>(run));
-        EXPECT_EQ(cmdList["v6"]["global"].size(), 14u * static_cast<unsigned>(run));
+    EXPECT_FALSE(translator.adapterIsEnabled("pppoe") || translator.adapterIsEnabled("vpn"));
+    for (const char *name : {"eth0", "ppp0", "tun5"})
+        addDummyInterface(name);
+    writeFile("/run/ppp-pppoe.pid", "4711\nppp0\n");
+    for (const char *name : {"eth0", "pppoe", "vpn"})
+        EXPECT_TRUE(translator.adapterIsEnabled(name)) << name;
+    for (const char *name : {"eth0", "ppp0", "tun5"})
+        removeInterface(name);
+    removeAll("/run/ppp-pppoe.pid");
+    for (const char *name : {"eth0", "pppoe", "vpn"}) {
+        EXPECT_TRUE(translator.adapterIsEnabled(name)) << name;
+        EXPECT_FALSE(FW::VELDFW_IPTABLES_RULES().adapterIsEnabled(name)) << name;
     }
 }
 
-TEST(Translator, KeepsItsViewOfTheSystemForItsLife) {
-    TranslationCase wanted;
-    wanted.interfaces = {"eth0", "ppp0", "tun5"};
-    wanted.pppoeInterface = "ppp0";
-    wanted.services = {{"app", true, {{"destination", {"tcp", {"1"}}}}}};
-    const CaseSystem system(wanted);
-    FW::VELDFW_IPTABLES_RULES old;
-    FW::ServPort ports;
-    EXPECT_TRUE(old.adapterIsEnabled("eth0") && old.adapterIsEnabled("vpn") && old.adapterIsEnabled("pppoe"));
-    EXPECT_TRUE(old.servToPorts({"app"}, ports));
-    for (const char *name : {"eth0", "ppp0", "tun5"})
-        removeInterface(name);
-    addDummyInterface("eth9");
-    removeAll("/run/ppp-pppoe.pid");
-    removeAll("/usr/veld/etc/services.d");
-    EXPECT_TRUE(old.adapterIsEnabled("eth0") && old.adapterIsEnabled("vpn") && old.adapterIsEnabled("pppoe"));
-    EXPECT_FALSE(old.adapterIsEnabled("eth9"));
-    EXPECT_TRUE(old.servToPorts({"app"}, ports));
-    EXPECT_THAT(ports.dstPorts[FW::FW_PROTO_TCP], ElementsAre("1", "1"));
-
-    FW::VELDFW_IPTABLES_RULES fresh;
-    EXPECT_FALSE(fresh.adapterIsEnabled("eth0") || fresh.adapterIsEnabled("vpn") || fresh.adapterIsEnabled("pppoe"));
-    EXPECT_TRUE(fresh.adapterIsEnabled("eth9"));
-    EXPECT_FALSE(fresh.adapterIsEnabled("ETH9"));
-    removeInterface("eth9");
-}
-
-TEST(Translator, AbsentNormalStateIsAskedForAgain) {
-    const CaseSystem system({});
-    FW::VELDFW_IPTABLES_RULES translator;
-    EXPECT_FALSE(translator.adapterIsEnabled("pppoe"));
-    EXPECT_FALSE(translator.adapterIsEnabled("vpn"));
-    addDummyInterface("ppp0");
-    addDummyInterface("tun0");
-    writeFile("/run/ppp-pppoe.pid", "4711\nppp0\n");
-    EXPECT_TRUE(translator.adapterIsEnabled("pppoe"));
-    EXPECT_TRUE(translator.adapterIsEnabled("vpn"));
-    removeInterface("ppp0");
-    removeInterface("tun0");
-}
-
-TEST(Translator, WirelessSystemWithoutInterfacesHasExactlyWlan0) {
-    TranslationCase wanted;
-    wanted.wireless = true;
-    const CaseSystem system(wanted);
-    FW::VELDFW_IPTABLES_RULES translator;
-    EXPECT_TRUE(translator.adapterIsEnabled("wlan0"));
-    EXPECT_FALSE(translator.adapterIsEnabled("lo"));
-}
-
-TEST(RuleArguments, VpnWithoutInterfacesNamesNoRealInterface) {
-    const CaseSystem system({});
-    FW::VELDFW_IPTABLES_RULES translator;
-    FW::FWRULE rule;
-    rule.adapterDirect = 0;
-    Json::Value args;
-    translator.iptablesRulesInit(args);
-    EXPECT_TRUE(translator.adapterToIptablesArg("vpn", rule, args));
-    ASSERT_EQ(args["adapter"].size(), 1u);
-    EXPECT_EQ(args["adapter"][0], "-o vpn");
-}
-
-TEST(RuleArguments, PppoeWithoutLinkFailsTheRule) {
-    const CaseSystem system({});
-    SystemLog log;
-    FW::VELDFW_IPTABLES_RULES translator;
-    Json::Value args;
-    translator.iptablesRulesInit(args);
-    EXPECT_FALSE(translator.FwRuleToIptablesArg("pppoe", FW::FWRULE(), args));
-    EXPECT_THAT(libraryMessages(log), ElementsAre("debug fwIptables.cpp Failed to VELDPPPoeIntfGet()",
-                                                  "error fwIptables.cpp pppoe interface is empty",
-                                                  "error fwIptables.cpp Failed to adapterToIptablesArg()"));
-    EXPECT_TRUE(args["chain"].empty());
-}
-
-TEST(RuleArguments, CommandWithoutTargetKeepsItsLastBlank) {
-    const CaseSystem system({});
+TEST_F(Translator, StepsByThemselvesNameAnAbsentVpnAndKeepTheBlankBeforeNoTarget) {
     FW::VELDFW_IPTABLES_RULES translator;
     FW::FWRULE rule;
     rule.policy = FW::FW_POLICY_NONE;
@@ -215,12 +265,12 @@ TEST(RuleArguments, CommandWithoutTargetKeepsItsLastBlank) {
     rule.chainList = {"INPUT_FIREWALL"};
     Json::Value args;
     translator.iptablesRulesInit(args);
-    ASSERT_TRUE(translator.FwRuleToIptablesArg("eth0", rule, args));
+    ASSERT_TRUE(translator.FwRuleToIptablesArg("vpn", rule, args));
     Json::Value cmdList;
-    translator.iptablesArgToCmd("eth0", rule, args, cmdList);
-    EXPECT_EQ(toText(cmdList), "v4 eth0\n"
-                               "    -t filter -A INPUT_FIREWALL -i eth0 -j LOG\n"
-                               "    -t filter -A INPUT_FIREWALL -i eth0 \n");
+    translator.iptablesArgToCmd("vpn", rule, args, cmdList);
+    EXPECT_EQ(toText(cmdList), "v4 vpn\n"
+                               "    -t filter -A INPUT_FIREWALL -i vpn -j LOG\n"
+                               "    -t filter -A INPUT_FIREWALL -i vpn \n");
 }
 
 }  // namespace
