@@ -32,13 +32,11 @@ bool tryLock(bool exclusive = true) {
 /// Takes the lock, shows that nobody else has it meanwhile, does something, and gives it back.
 bool beAlone(const std::function<void()> &meanwhile) {
     const int fd = takeLock(60);
-    if (fd < 0 || mkdir("/run/inside", 0700) != 0)
-        return false;
+    const bool entered = fd >= 0 && mkdir("/run/inside", 0700) == 0;
     usleep(200);
-    if (rmdir("/run/inside") != 0)
-        return false;
+    const bool left = entered && rmdir("/run/inside") == 0;
     meanwhile();
-    return VLIBCFileUnlockByFile(fd) != 0;
+    return VLIBCFileUnlockByFile(fd) != 0 && left;
 }
 
 void expectSuccess(const std::vector<pid_t> &children) {
