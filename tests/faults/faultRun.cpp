@@ -1,0 +1,220 @@
+// SPDX-License-Identifier: Apache-2.0
+// A child and its descendants under ptrace, and a system call of theirs replaced.
+#include "faultRun.h"
+
+#include <elf.h>
+#include <sys/ptrace.h>
+#include <sys/syscall.h>
+#include <sys/uio.h>
+#include <sys/user.h>
+#include <sys/wait.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <csignal>
+#include <cstddef>
+#include <map>
+#include <stdexcept>
+
+#include "processes.h"
+
+namespace veldtest {
+namespace {
+
+/// Lets the call, at whose entry the process stands, be one that does not exist.
+bool callSkip(pid_t process) {
+#if defined(__x86_64__)
+    return ptrace(PTRACE_POKEUSER, process, offsetof(user_regs_struct, orig_rax), -1) == 0;
+#elif defined(__aarch64__)
+    int none = -1;
+    iovec part = {&none, sizeof(none)};
+    return ptrace(PTRACE_SETREGSET, process, NT_ARM_SYSTEM_CALL, &part) == 0;
+#else
+    (void)process;
+    return false;
+#endif
+}
+
+/// Sets what the call, at whose return the process stands, gives back.
+void resultSet(pid_t process, long result) {
+#if defined(__x86_64__)
+    ptrace(PTRACE_POKEUSER, process, offsetof(user_regs_struct, rax), result);
+#elif defined(__aarch64__)
+    user_regs_struct registers = {};
+    iovec all = {&registers, sizeof(registers)};
+    ptrace(PTRACE_GETREGSET, process, NT_PRSTATUS, &all);
+    registers.regs[0] = static_cast<unsigned long>(result);
+    ptrace(PTRACE_SETREGSET, process, NT_PRSTATUS, &all);
+#else
+    (void)process, (void)result;
+#endif
+}
+
+const std::map<uint64_t, std::vector<int>> &errorTable() {
+    static const std::map<uint64_t, std::vector<int>> table = [] {
+        std::map<uint64_t, std::vector<int>> errors = {
+            {SYS_openat, {EMFILE, EACCES, EIO}},
+            {SYS_read, {EIO, EINTR}},
+            {SYS_pread64, {EIO}},
+            {SYS_write, {ENOSPC, EIO, EINTR}},
+            {SYS_close, {EIO}},
+            {SYS_lseek, {EINVAL}},
+            {SYS_fsync, {EIO, ENOSPC}},
+            {SYS_fchmod, {EPERM, EROFS}},
+            {SYS_ftruncate, {EIO}},
+            {SYS_newfstatat, {EACCES}},
+            {SYS_fstat, {EIO}},
+            {SYS_getdents64, {EIO}},
+            {SYS_fcntl, {EINTR, ENOLCK}},
+            {SYS_flock, {EINTR}},
+            {SYS_mmap, {ENOMEM}},
+            {SYS_mprotect, {ENOMEM}},
+            {SYS_memfd_create, {EMFILE, ENOMEM}},
+            {SYS_dup3, {EMFILE}},
+            {SYS_pipe2, {EMFILE}},
+            {SYS_clone, {EAGAIN, ENOMEM}},
+            {SYS_clone3, {EAGAIN, ENOMEM}},
+            {SYS_execve, {ENOENT, EACCES, ENOMEM}},
+            {SYS_wait4, {EINTR}},
+            {SYS_socket, {EMFILE, EACCES}},
+            {SYS_bind, {ENOMEM}},
+            {SYS_connect, {ECONNREFUSED}},
+            {SYS_sendto, {ENOBUFS}},
+            {SYS_sendmsg, {ENOBUFS, EPERM}},
+            {SYS_recvmsg, {ENOBUFS}},
+            {SYS_recvfrom, {ENOBUFS}},
+            {SYS_setsockopt, {EPERM}},
+            {SYS_getsockopt, {EPERM, ENOENT}},
+            {SYS_ioctl, {EIO}},
+            {SYS_unlinkat, {EIO}},
+            {SYS_renameat2, {EIO, ENOSPC}},
+            {SYS_mkdirat, {ENOSPC}},
+            {SYS_faccessat, {EACCES}},
+        };
+#ifdef SYS_open
+        for (const auto &[number, other] : {std::pair(SYS_open, SYS_openat),
+                                            {SYS_stat, SYS_newfstatat},
+                                            {SYS_lstat, SYS_newfstatat},
+                                            {SYS_rename, SYS_renameat2},
+                                            {SYS_unlink, SYS_unlinkat},
+                                            {SYS_mkdir, SYS_mkdirat},
+                                            {SYS_access, SYS_faccessat},
+                                            {SYS_dup2, SYS_dup3},
+                                            {SYS_pipe, SYS_pipe2},
+                                            {SYS_vfork, SYS_clone},
+                                            {SYS_fork, SYS_clone}})
+            errors[static_cast<uint64_t>(number)] = errors.at(static_cast<uint64_t>(other));
+#endif
+#ifdef SYS_renameat
+        errors[SYS_renameat] = errors.at(SYS_renameat2);
+#endif
+        return errors;
+    }();
+    return table;
+}
+
+class Tracer {
+public:
+    Tracer(long faultAt, int faultError) : at(faultAt), error(faultError) {}
+
+    FaultRun run(const std::function<int()> &function) {
+        child = startChild([&] {
+            if (ptrace(PTRACE_TRACEME, 0, nullptr, nullptr) != 0)
+                return 126;
+            raise(SIGSTOP);
+            return function();
+        });
+        int status = 0;
+        waitpid(child, &status, 0);
+        constexpr int options = PTRACE_O_TRACESYSGOOD | PTRACE_O_EXITKILL | PTRACE_O_TRACECLONE | PTRACE_O_TRACEFORK |
+                                PTRACE_O_TRACEVFORK | PTRACE_O_TRACEEXEC;
+        if (!WIFSTOPPED(status) || ptrace(PTRACE_SETOPTIONS, child, nullptr, options) != 0) {
+            kill(child, SIGKILL);
+            throw std::runtime_error("processes may not be traced here");
+        }
+        traced[child] = {0, 0, false};
+        ptrace(PTRACE_SYSCALL, child, nullptr, 0);
+        while (!traced.empty()) {
+            const pid_t process = waitpid(-1, &status, __WALL);
+            if (process < 0)
+                break;
+            if (WIFSTOPPED(status))
+                stopped(process, status);
+            else
+                ended(process, status);
+        }
+        if (cannotReplace)
+            throw std::runtime_error("system calls cannot be replaced here");
+        return result;
+    }
+
+private:
+    struct Traced {
+        int ordinal = 0;
+        uint64_t number = 0;
+        bool isStruck = false;
+    };
+
+    void ended(pid_t process, int status) {
+        traced.erase(process);
+        if (process == child)
+            result.status = WIFSIGNALED(status) ? 128 + WTERMSIG(status) : WEXITSTATUS(status);
+    }
+
+    void stopped(pid_t process, int status) {
+        int signal = 0;
+        if (traced.count(process) == 0) {
+            traced[process].ordinal = ++started;  // stopped by SIGSTOP at its start
+        } else if (WSTOPSIG(status) == (SIGTRAP | 0x80)) {
+            if (!systemCall(process, traced[process]))
+                return;
+        } else if (status >> 16 == 0) {
+            signal = WSTOPSIG(status) == SIGSTOP ? 0 : WSTOPSIG(status);
+        }
+        ptrace(PTRACE_SYSCALL, process, nullptr, signal);
+    }
+
+    /// @return false when the process is gone
+    bool systemCall(pid_t process, Traced &state) {
+        __ptrace_syscall_info info = {};
+        ptrace(static_cast<__ptrace_request>(PTRACE_GET_SYSCALL_INFO), process, sizeof(info), &info);
+        if (info.op == PTRACE_SYSCALL_INFO_EXIT) {
+            if (state.isStruck)
+                resultSet(process, -error);
+            state.isStruck = false;
+            return true;
+        }
+        if (info.op != PTRACE_SYSCALL_INFO_ENTRY || errorTable().count(info.entry.nr) == 0)
+            return true;
+        result.points.push_back({state.ordinal, info.entry.nr});
+        if (static_cast<long>(result.points.size()) - 1 != at)
+            return true;
+        if (error == killProcess) {
+            kill(process, SIGKILL);
+            return false;
+        }
+        state.isStruck = callSkip(process);
+        cannotReplace = !state.isStruck;
+        return true;
+    }
+
+    const long at;
+    const int error;
+    pid_t child = -1;
+    int started = 0;
+    bool cannotReplace = false;
+    std::map<pid_t, Traced> traced;
+    FaultRun result;
+};
+
+}  // namespace
+
+FaultRun runWithFault(const std::function<int()> &function, long at, int error) {
+    return Tracer(at, error).run(function);
+}
+
+std::vector<int> errorsOf(uint64_t number) {
+    return errorTable().at(number);
+}
+
+}  // namespace veldtest
