@@ -10,6 +10,7 @@
 #include "fw/programRun.h"
 #include "fw/restoreInput.h"
 #include "utils/log.h"
+#include "veldfirewall/fwIptables.h"
 #include "veldfirewall/veldFW.h"
 
 namespace FW {
@@ -197,11 +198,10 @@ void failureLog(const FwApplyFailure &failure) {
 }
 
 /// Adds to the failure which rule of the profile the command comes from.
-void originTell(FwApplyFailure &failure) {
-    FWPROFILE profile;
+void originTell(const FWPROFILE &profile, FwApplyFailure &failure) {
     CommandOrigin origin;
     const size_t arguments = failure.command.find(' ') + 1;
-    if (!failure.command.empty() && VELDFW_PROFILE().profileGet(failure.profile, profile) &&
+    if (!failure.command.empty() &&
         commandOriginFind(profile, failure.family, failure.command.substr(arguments), origin)) {
         failure.adapter = origin.adapter;
         failure.rulePosition = origin.rulePosition;
@@ -253,12 +253,21 @@ bool VELDFW::fwReloadAtomic(bool keepEstablished, FwApplyFailure &failure) {
     if (!fwProfileConfigGet(found.profile)) {
         return fail("Failed to fwProfileConfigGet()");
     }
+    FWPROFILE profile;
+    if (!VELDFW_PROFILE().profileGet(found.profile, profile)) {
+        return fail("Failed to profileGet()");
+    }
+    // Asked first: without the interfaces the translator leaves out their rules, and that is not the profile.
+    VELDFW_IPTABLES_RULES translator;
+    if (!translator.enabledAdapterEnum()) {
+        return fail("Failed to enabledAdapterEnum()");
+    }
     Json::Value commands;
-    if (!fwIptablesRulesEnum(found.profile, commands, keepEstablished)) {
-        return fail("Failed to fwIptablesRulesEnum()");
+    if (!translator.fwRulesToIptablesRules(keepEstablished, profile.rules, profile.adapterPolicyMap, commands)) {
+        return fail("Failed to fwRulesToIptablesRules()");
     }
     if (!commandListApply(commands, found)) {
-        originTell(found);
+        originTell(profile, found);
         failureLog(found);
         failure = found;
         return false;

@@ -25,11 +25,8 @@ Descriptor memoryFile(const char *name) {
     return Descriptor(memfd_create(name, MFD_CLOEXEC));
 }
 
-std::string contentOf(const Descriptor &file) {
-    std::string text;
-    lseek(file.get(), 0, SEEK_SET);
-    readAll(file.get(), text);
-    return text;
+bool contentRead(const Descriptor &file, std::string &text) {
+    return lseek(file.get(), 0, SEEK_SET) == 0 && readAll(file.get(), text);
 }
 
 int spawn(const std::vector<std::string> &command, int in, int out, int err, pid_t &process) {
@@ -81,8 +78,10 @@ int runOnce(const std::vector<std::string> &command, const std::string &input, P
             return -1;
         }
     }
-    run.output = contentOf(out);
-    run.message = contentOf(err);
+    if (!contentRead(out, run.output) || !contentRead(err, run.message)) {
+        run.message = std::string("what it printed is lost: ") + std::strerror(errno);
+        return -1;
+    }
     run.message.erase(run.message.find_last_not_of(" \n") + 1);
     if (WIFSIGNALED(status)) {
         run.message += " (killed by signal " + std::to_string(WTERMSIG(status)) + ")";
