@@ -193,7 +193,8 @@ private:
             kill(process, SIGKILL);
             return false;
         }
-        state.isStruck = callSkip(process);
+        // A close that reports an error has closed the descriptor all the same.
+        state.isStruck = info.entry.nr == SYS_close || callSkip(process);
         cannotReplace = !state.isStruck;
         return true;
     }
