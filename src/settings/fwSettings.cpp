@@ -4,6 +4,9 @@
 
 #include <unistd.h>
 
+#include <cerrno>
+#include <cstring>
+
 #include "utils/log.h"
 #include "veldfirewall/utils.h"
 
@@ -26,7 +29,13 @@ void settingsInit(Json::Value &settings) {
 }
 
 bool settingsGet(Json::Value &settings) {
-    if (access(SETTINGS_PATH, F_OK) != 0) {
+    const bool isReachable = access(SETTINGS_PATH, F_OK) == 0;
+    // Only what is missing for sure may be replaced by the defaults, which switch the firewall off.
+    if (!isReachable && errno != ENOENT && errno != ENOTDIR) {
+        SETTINGS_LOG_ERR("Failed to reach %s: %s", SETTINGS_PATH, std::strerror(errno));
+        return false;
+    }
+    if (!isReachable) {
         settingsInit(settings);
         jsonFileDump(settings, SETTINGS_PATH);
         return true;
