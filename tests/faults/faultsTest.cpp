@@ -215,9 +215,9 @@ TEST_P(ReloadFaults, LeaveTheOldOrTheNewRulesAfterAnAtomicReload) {
         const FaultRun run = runWithFault(reload, fault.at, fault.error);
         const auto left = rules();
         if (run.status == 0) {
-            EXPECT_EQ(left, newRules) << log.text();
+            EXPECT_TRUE(left == newRules) << log.text();
         } else if (run.status == 1) {
-            EXPECT_EQ(left, oldRules) << log.text();
+            EXPECT_TRUE(left == oldRules) << log.text();
         } else {
             EXPECT_TRUE(left.first == oldRules.first || left.first == newRules.first) << left.first;
             EXPECT_TRUE(left.second == oldRules.second || left.second == newRules.second) << left.second;
@@ -225,8 +225,6 @@ TEST_P(ReloadFaults, LeaveTheOldOrTheNewRulesAfterAnAtomicReload) {
         EXPECT_TRUE(execLockIsFree());
         expectDocuments("other");
         outcomes[run.status == 0 ? "succeeded" : run.status == 1 ? "failed" : "killed"] += 1;
-        if (HasFailure())
-            break;
     }
     print("atomic reload", faults.size(), outcomes);
     EXPECT_GT(faults.size(), 50u);
