@@ -20,7 +20,6 @@
 namespace veldtest {
 namespace {
 
-using testing::HasSubstr;
 using veldfwctl::Decision;
 
 constexpr uint16_t EPHEMERAL_PORT = 40000;  // stands for what the kernel chooses: no rule names ports there

@@ -165,7 +165,7 @@ TEST_F(LintTest, EachPlantedFaultIsFoundAndNothingElse) {
         if (!entry.finding.empty()) {
             expected.push_back(entry.finding);
         }
-        const size_t number = static_cast<size_t>(&entry - cases.data());
+        const auto number = static_cast<size_t>(&entry - cases.data());
         EXPECT_EQ(expected, findings()) << "case " << number << "\n" << runTool({"lint"}).output;
     }
 }

@@ -10,7 +10,8 @@ namespace veldfwctl {
 namespace {
 
 /// Beyond that many pieces the question is left open: what is left of the packets is then not nothing anyway.
-constexpr size_t MOST_PIECES = 2000;
+constexpr size_t MOST_PIECES = 300;
+constexpr size_t MOST_TO_CHOOSE_FROM = 40;  // beyond that, all are named
 
 enum class Answer { YES, NO, UNKNOWN };
 
@@ -32,25 +33,50 @@ Answer masksHold(const PacketRule &rule, const PacketSet &packets) {
 }
 
 /// Takes the packets of `removed` out of each piece.
-std::vector<PacketSet> piecesWithout(const std::vector<PacketSet> &pieces, const PacketSet &removed) {
+std::vector<PacketSet> piecesWithout(std::vector<PacketSet> pieces, const PacketSet &removed) {
     std::vector<PacketSet> rest;
-    for (const PacketSet &piece : pieces) {
+    rest.reserve(pieces.size());
+    for (PacketSet &piece : pieces) {
+        if (!piece.meets(removed)) {
+            rest.push_back(std::move(piece));
+            continue;
+        }
         std::vector<PacketSet> parts = packetsWithout(piece, removed);
         std::move(parts.begin(), parts.end(), std::back_inserter(rest));
     }
     return rest;
 }
 
-/// Whether the rules together take all the packets.
-bool areTakenBy(const PacketSet &packets, const std::vector<PacketRule> &rules, const std::vector<size_t> &indices) {
+/// How many of the rules, from the first, it needs to take all the packets; 0 when they leave some.
+size_t countTaking(const PacketSet &packets, const std::vector<PacketRule> &rules, const std::vector<size_t> &indices) {
     std::vector<PacketSet> rest = {packets};
-    for (const size_t index : indices) {
-        rest = piecesWithout(rest, rules[index].packets);
-        if (rest.empty() || rest.size() > MOST_PIECES) {
-            break;
+    for (size_t i = 0; i < indices.size() && rest.size() <= MOST_PIECES; ++i) {
+        rest = piecesWithout(std::move(rest), rules[indices[i]].packets);
+        if (rest.empty()) {
+            return i + 1;
         }
     }
-    return rest.empty();
+    return 0;
+}
+
+/// Of rules that together take all the packets, those that it takes: the firewall's own rules take a little of most.
+std::vector<size_t> fewestTaking(const PacketSet &packets, const std::vector<PacketRule> &rules,
+                                 std::vector<size_t> indices) {
+    const auto one = std::find_if(indices.begin(), indices.end(),
+                                  [&](size_t index) { return packetsWithout(packets, rules[index].packets).empty(); });
+    if (one != indices.end()) {
+        return {*one};
+    }
+    for (size_t at = 0; at < indices.size() && indices.size() <= MOST_TO_CHOOSE_FROM;) {
+        std::vector<size_t> fewer = indices;
+        fewer.erase(fewer.begin() + static_cast<std::ptrdiff_t>(at));
+        if (countTaking(packets, rules, fewer) > 0) {
+            indices = std::move(fewer);
+        } else {
+            ++at;
+        }
+    }
+    return indices;
 }
 
 }  // namespace
@@ -77,7 +103,7 @@ std::vector<Decision> packetsDecide(const PacketSet &packets, const std::vector<
             continue;
         }
         if (decision.isCertain) {
-            rest = piecesWithout(rest, rule.packets);
+            rest = piecesWithout(std::move(rest), rule.packets);
         }
         decisions.push_back(std::move(decision));
     }
@@ -107,20 +133,10 @@ Shadow shadowFind(const std::vector<PacketRule> &rules, size_t index, const Pack
             candidates.push_back(i);
         }
     }
-    shadow.isShadowed = areTakenBy(packets, rules, candidates);
-    if (shadow.isShadowed) {
-        // Only those that it takes: the firewall's own rules take something of most.
-        for (size_t at = 0; at < candidates.size();) {
-            std::vector<size_t> fewer = candidates;
-            fewer.erase(fewer.begin() + static_cast<std::ptrdiff_t>(at));
-            if (areTakenBy(packets, rules, fewer)) {
-                candidates = std::move(fewer);
-            } else {
-                ++at;
-            }
-        }
-        shadow.by = std::move(candidates);
-    }
+    const size_t count = countTaking(packets, rules, candidates);
+    shadow.isShadowed = count > 0;
+    candidates.resize(count);
+    shadow.by = fewestTaking(packets, rules, std::move(candidates));
     return shadow;
 }
 

@@ -16,6 +16,8 @@ namespace {
 constexpr size_t MOST_ARGUMENTS = 255;  // program included
 constexpr size_t MOST_BYTES = 1024;     // one more for the end of each argument
 
+constexpr size_t MOST_NAMED = 5;  // rules that shadow another
+
 using Place = std::pair<std::string, size_t>;  // adapter and number
 
 bool isOurs(const PacketRule &rule) {
@@ -91,6 +93,11 @@ std::vector<Finding> shadowsLint(const Ruleset &ruleset) {
             if (!isItself && std::find(names.begin(), names.end(), plannedText(earlier)) == names.end()) {
                 names.push_back(plannedText(earlier));
             }
+        }
+        if (names.size() > MOST_NAMED) {
+            const size_t more = names.size() - MOST_NAMED;
+            names.resize(MOST_NAMED);
+            names.push_back(std::to_string(more) + " more");
         }
         const RuleCommands &rule = *ruleset.plan[commands.front()].origin;
         if (names.empty()) {
