@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Runs programs with input, and keeps what they print.
+// Runs programs and keeps what they print.
 #include "system/program.h"
 
 #include <spawn.h>
@@ -10,7 +10,9 @@
 #include <array>
 #include <cerrno>
 #include <cstring>
+#include <system_error>
 
+#include "frame/context.h"
 #include "frame/errors.h"
 #include "model/numbers.h"
 
@@ -18,35 +20,27 @@ namespace veldfwctl {
 
 namespace {
 
-/// A file in memory: unlike a pipe it is never full.
-class MemoryFile {
+/// Text in memory that a program can read or write as a file: unlike pipes, three of them cannot block each other.
+class MemoryText {
 public:
-    MemoryFile() : m_handle(memfd_create("program", MFD_CLOEXEC)) {}
-    ~MemoryFile() { close(m_handle); }
-    MemoryFile(const MemoryFile &) = delete;
-    MemoryFile &operator=(const MemoryFile &) = delete;
+    explicit MemoryText(const std::string &text = "") : m_handle(memfd_create("veldfwctl-program", MFD_CLOEXEC)) {
+        if (m_handle < 0 || pwrite(m_handle, text.data(), text.size(), 0) != static_cast<ssize_t>(text.size())) {
+            throw std::system_error(errno, std::generic_category(), "memory for a program's text");
+        }
+    }
+    ~MemoryText() { close(m_handle); }
+    MemoryText(const MemoryText &) = delete;
+    MemoryText &operator=(const MemoryText &) = delete;
 
     int handle() const { return m_handle; }
-
-    bool fill(const std::string &text) const {
-        for (size_t done = 0; done < text.size();) {
-            const ssize_t count = write(m_handle, text.data() + done, text.size() - done);
-            if (count < 0) {
-                return false;
-            }
-            done += static_cast<size_t>(count);
+    std::string text() const {
+        std::string all;
+        std::array<char, 4096> buffer;
+        ssize_t count = 0;
+        while ((count = pread(m_handle, buffer.data(), buffer.size(), static_cast<off_t>(all.size()))) > 0) {
+            all.append(buffer.data(), static_cast<size_t>(count));
         }
-        return lseek(m_handle, 0, SEEK_SET) == 0;
-    }
-
-    std::string content() const {
-        std::string text;
-        std::array<char, 8192> buffer = {};
-        lseek(m_handle, 0, SEEK_SET);
-        for (ssize_t count = 0; (count = read(m_handle, buffer.data(), buffer.size())) > 0;) {
-            text.append(buffer.data(), static_cast<size_t>(count));
-        }
-        return text;
+        return all;
     }
 
 private:
@@ -55,46 +49,52 @@ private:
 
 }  // namespace
 
+std::string ProgramOutput::reason() const {
+    const std::string said = oneLine(errors);
+    return said.empty() ? "exited with status " + std::to_string(status) : said;
+}
+
 ProgramOutput programRun(const std::vector<std::string> &command, const std::string &input) {
-    const MemoryFile in;
-    const MemoryFile out;
-    const MemoryFile err;
-    if (!in.fill(input)) {
-        throw Failure("Cannot keep the input of " + command.front() + ": " + std::strerror(errno));
-    }
-    std::vector<std::string> words = command;
+    const MemoryText in(input);
+    const MemoryText out;
+    const MemoryText error;
     std::vector<char *> arguments;
-    arguments.reserve(words.size() + 1);
-    for (std::string &word : words) {
-        arguments.push_back(word.data());
+    arguments.reserve(command.size() + 1);
+    for (const std::string &argument : command) {
+        arguments.push_back(const_cast<char *>(argument.c_str()));
     }
     arguments.push_back(nullptr);
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
     posix_spawn_file_actions_adddup2(&actions, in.handle(), STDIN_FILENO);
     posix_spawn_file_actions_adddup2(&actions, out.handle(), STDOUT_FILENO);
-    posix_spawn_file_actions_adddup2(&actions, err.handle(), STDERR_FILENO);
+    posix_spawn_file_actions_adddup2(&actions, error.handle(), STDERR_FILENO);
     posix_spawn_file_actions_addclosefrom_np(&actions, STDERR_FILENO + 1);
     pid_t process = -1;
-    const int error = posix_spawn(&process, arguments.front(), &actions, nullptr, arguments.data(), environ);
+    const int started = posix_spawn(&process, arguments[0], &actions, nullptr, arguments.data(), environ);
     posix_spawn_file_actions_destroy(&actions);
-    if (error != 0) {
-        throw Failure("Cannot start " + command.front() + ": " + std::strerror(error) +
-                      "; run \"veldfwctl doctor\" to see which programs are missing");
+    ProgramOutput result;
+    if (started != 0) {
+        result.status = 127;
+        result.errors = command[0] + ": " + std::strerror(started);
+        return result;
     }
     int status = 0;
     while (waitpid(process, &status, 0) < 0 && errno == EINTR) {
     }
-    return {WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status), out.content(), err.content()};
+    result.status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+    result.output = out.text();
+    result.errors = error.text();
+    return result;
 }
 
 std::string programRequire(const std::vector<std::string> &command, const std::string &input) {
-    const ProgramOutput result = programRun(command, input);
-    if (result.status != 0) {
-        throw Failure("\"" + join(command, " ") + "\" failed with status " + std::to_string(result.status) + ": " +
-                      result.errors);
+    ProgramOutput result = programRun(command, input);
+    if (!result.succeeded()) {
+        throw Failure("\"" + join(command, " ") + "\" failed: " + result.reason() +
+                      "; run \"veldfwctl doctor\" to see what is missing");
     }
-    return result.output;
+    return std::move(result.output);
 }
 
 }  // namespace veldfwctl
