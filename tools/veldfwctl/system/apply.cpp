@@ -4,6 +4,7 @@
 
 #include <sys/ioctl.h>
 #include <unistd.h>
+#include <veldfirewall/fwHook.h>
 
 #include <algorithm>
 #include <chrono>
@@ -155,6 +156,27 @@ void applicationApply(const Context &context, const Application &application) {
     if (!result.succeeded) {
         failureReport(context, application, result.messages);
     }
+}
+
+bool enableAtomic(FW::FwApplyFailure &failure) {
+    FW::VELDFW firewall;
+    bool before = false;
+    if (!firewall.fwStatus(before)) {
+        return false;
+    }
+    const auto switchTo = [&firewall](bool enabled) {
+        Json::Value change;
+        change["status"] = enabled;
+        return firewall.configSet(change);
+    };
+    FW::VeldFwHook hook;  // it logs its failures, which do not stop the switch
+    hook.RunFwEnablePreHook();
+    const bool succeeded = switchTo(true) && firewall.fwReloadAtomic(true, failure);
+    if (!succeeded && !before) {
+        switchTo(false);
+    }
+    hook.RunFwEnablePostHook(succeeded);
+    return succeeded;
 }
 
 bool reloadRun(const Context &context) {

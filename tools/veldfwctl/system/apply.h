@@ -25,6 +25,10 @@ struct Application {
 ///         on now; with --json an object with these is printed before
 void applicationApply(const Context &context, const Application &application);
 
+/// Switches the firewall on as VELDFW::fwEnable() does, but applies the active profile as a whole. After a failure the
+/// switch is as it was. To be run as Application::operate.
+bool enableAtomic(FW::FwApplyFailure &failure);
+
 /// Applies the active profile again, if the firewall is on. @return whether it is on
 bool reloadRun(const Context &context);
 
