@@ -59,7 +59,7 @@ protected:
         }
         ToolTest::SetUp();
         createFirewallChains();
-        writeFile(PROFILES + "1.json", R"({"name": "default", "adapterPolicyMap": {"eth9": 0}, "rules": null})");
+        writeFile(PROFILES + "1.json", R"({"name": "default", "adapterPolicyMap": {"eth9": 0}})");
         writeFile(PROFILES + "2.json", R"({"name": "closed", "adapterPolicyMap": {"eth9": 1}, "rules": null})");
         m_client.emplace("client");
         addVethPair("eth9", *m_client, "eth0");
@@ -259,6 +259,30 @@ TEST_F(TryTest, AProfileThatCannotBeAppliedLeavesEverythingAsItWas) {
             EXPECT_EQ(isOn, parseJson(runTool({"status", "--json"}).output)["enabled"].asBool());
             EXPECT_FALSE(status()["trial"].asBool());
         }
+    }
+}
+
+TEST_F(TryTest, AnAtomicApplyHoldsNothingUpAndAFailedOneLeavesTheFirewallOn) {
+    const ProgramResult enabled = runTool({"enable", "--atomic"});
+    EXPECT_EQ(0, enabled.status) << enabled.errors;
+    EXPECT_THAT(enabled.output, HasSubstr("New traffic was not held up.\nThe firewall is on"));
+    EXPECT_GT(parseJson(runTool({"reload", "--json"}).output)["heldUpMilliseconds"].asInt(), 0);
+    EXPECT_EQ(0, parseJson(runTool({"reload", "--atomic", "--json"}).output)["heldUpMilliseconds"].asInt());
+    const Listing v4 = rulesOf("/sbin/iptables");
+    writeFile(PROFILES + "1.json", readFile(PROFILES + "1.json")
+                                       .replace(0, 1,
+                                                R"({"rules": {
+      "eth9": [{"name": "bad", "enable": true, "adapterDirect": 1, "protocol": 1, "policy": 1, "blLog": false,
+                "table": "filter", "ipType": 0, "ipDirect": 1, "ipGroup": 0, "ipList": ["300.1.1.1"], "portDirect": 0,
+                "portGroup": 3, "portList": []}]}, "n": )"
+                                                "0, "));
+    for (const std::string verb : {"reload", "enable"}) {
+        const ProgramResult failed = runTool({verb, "--atomic"});
+        EXPECT_EQ(3, failed.status);
+        EXPECT_THAT(failed.errors, HasSubstr("adapter eth9, rule 1 \"bad\""));
+        EXPECT_THAT(failed.errors, HasSubstr("300.1.1.1"));
+        EXPECT_THAT(failed.errors, HasSubstr("still marked as on"));
+        EXPECT_EQ(v4, rulesOf("/sbin/iptables"));
     }
 }
 

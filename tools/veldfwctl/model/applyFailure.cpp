@@ -4,10 +4,27 @@
 
 namespace veldfwctl {
 
+namespace {
+
+const std::string ATOMIC_START = "Failed to apply the rules, the old ones stay in force";
+
+}  // namespace
+
 FailedCommand failedCommandFind(const std::vector<std::string> &messages) {
     static const std::string start = "Failed to execute \"";
     FailedCommand failed;
     for (const std::string &message : messages) {
+        if (message.compare(0, ATOMIC_START.size(), ATOMIC_START) == 0) {
+            // "...: v4: "/sbin/iptables -A ...": what iptables-restore said"
+            const size_t command = message.find(": \"/");
+            const size_t end = command == std::string::npos ? command : message.find("\": ", command + 3);
+            if (end == std::string::npos) {
+                continue;
+            }
+            failed.command = message.substr(command + 3, end - command - 3);
+            failed.said = message.substr(end + 3);
+            return failed;
+        }
         if (message.compare(0, start.size(), start) == 0 && message.back() == '"') {
             failed.command = message.substr(start.size(), message.size() - start.size() - 1);
             break;

@@ -147,8 +147,19 @@ std::string aftermath() {
 
 }  // namespace
 
-void applicationApply(const Context &context, const Application &application) {
+std::string heldUpText(std::chrono::milliseconds time) {
+    if (time.count() == 0) {
+        return "New traffic was not held up.";
+    }
+    // Rounded up: the time between the policies DROP and ACCEPT lies somewhere inside.
+    const auto tenths = (time.count() + 99) / 100;
+    return "New traffic was held up for at most " + std::to_string(tenths / 10) + "." + std::to_string(tenths % 10) +
+           " s.";
+}
+
+std::chrono::milliseconds applicationApply(const Context &context, const Application &application) {
     CallResult result;
+    const auto start = Clock::now();
     {
         Progress progress(context, application);
         result = protectedCall(application.operate, [&progress](int process) { progress.update(process); });
@@ -156,6 +167,12 @@ void applicationApply(const Context &context, const Application &application) {
     if (!result.succeeded) {
         failureReport(context, application, result.messages);
     }
+    const auto heldUp = application.atomic ? std::chrono::milliseconds(0)
+                                           : std::chrono::ceil<std::chrono::milliseconds>(Clock::now() - start);
+    if (!application.profile.empty()) {
+        context.print(heldUpText(heldUp));
+    }
+    return heldUp;
 }
 
 bool enableAtomic(FW::FwApplyFailure &failure) {
@@ -179,12 +196,17 @@ bool enableAtomic(FW::FwApplyFailure &failure) {
     return succeeded;
 }
 
-bool reloadRun(const Context &context) {
+bool reloadRun(const Context &context, bool atomic, std::chrono::milliseconds *heldUp) {
     const Settings settings = settingsRead();
     if (settings.enabled) {
-        applicationApply(context, {"Applying profile \"" + settings.profile + "\"",
-                                   "Cannot apply profile \"" + settings.profile + "\"", settings.profile,
-                                   [] { return FW::VELDFW().fwReload(true); }});
+        const auto time = applicationApply(
+            context,
+            {"Applying profile \"" + settings.profile + "\"", "Cannot apply profile \"" + settings.profile + "\"",
+             settings.profile,
+             [atomic] { return atomic ? FW::VELDFW().fwReloadAtomic(true) : FW::VELDFW().fwReload(true); }, atomic});
+        if (heldUp != nullptr) {
+            *heldUp = time;
+        }
     }
     return settings.enabled;
 }

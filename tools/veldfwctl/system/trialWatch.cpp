@@ -66,6 +66,7 @@ public:
         }
         m_record.watch = getpid();
         trialRecordWrite(m_file, m_record);
+        const int64_t start = nowMilliseconds();
         const CallResult applied = trialApply(m_record, m_request.client);
         if (!applied.succeeded) {
             const std::string reason =
@@ -73,11 +74,12 @@ public:
             messageSend(starter, answer(false, reason + takeBack("it could not be applied", false)));
             return;
         }
-        const int64_t deadline = nowMilliseconds() + m_request.seconds * MILLI;
+        const int64_t now = nowMilliseconds();
+        const int64_t deadline = now + m_request.seconds * MILLI;
         m_record.phase = TrialPhase::ON_TRIAL;
         m_record.until = std::time(nullptr) + m_request.seconds;
         trialRecordWrite(m_file, m_record);
-        messageSend(starter, answer(true, ""));
+        messageSend(starter, answer(true, std::to_string(m_record.atomic ? 0 : now - start)));
         serve(socket, deadline);
     }
 
@@ -227,7 +229,7 @@ Descriptor lockAwait() {
 
 }  // namespace
 
-void trialStart(const TrialRequest &request) {
+std::chrono::milliseconds trialStart(const TrialRequest &request) {
     const Descriptor lock = trialLockTake();
     if (!lock.isOpen()) {
         throw Failure("Another trial is under way; end it with \"veldfwctl try --confirm\" or \"try --revert\"");
@@ -273,6 +275,7 @@ void trialStart(const TrialRequest &request) {
     if (report->front() != '+') {
         throw Failure(report->substr(1));
     }
+    return std::chrono::milliseconds(std::stoll(report->substr(1)));
 }
 
 std::string trialEnd(bool keep) {

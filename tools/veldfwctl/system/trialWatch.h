@@ -3,6 +3,7 @@
 #ifndef VELDFWCTL_TRIALWATCH_H
 #define VELDFWCTL_TRIALWATCH_H
 
+#include <chrono>
 #include <string>
 
 namespace veldfwctl {
@@ -16,8 +17,9 @@ struct TrialRequest {
 
 /// Starts a trial: prepares the way back, starts the watch, which applies the trial copy once it listens, and waits for
 /// its word. The watch belongs to no terminal and no session, and needs nothing from the process that started it.
+/// @return for how long new traffic was held up, at most
 /// @throws UsageError, Failure; what was before is in force then
-void trialStart(const TrialRequest &request);
+std::chrono::milliseconds trialStart(const TrialRequest &request);
 
 /// Asks the watch to keep the profile or to take it back, and waits until that is done. A trial whose watch was killed
 /// can only be taken back, which is done right here.

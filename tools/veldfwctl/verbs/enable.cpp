@@ -2,6 +2,8 @@
 // "enable": switches the firewall on.
 #include <veldfirewall/veldFW.h>
 
+#include <memory>
+
 #include "frame/verb.h"
 #include "system/apply.h"
 #include "system/store.h"
@@ -10,17 +12,23 @@ namespace veldfwctl {
 
 namespace {
 
-int enable(const Context &context) {
+int enable(const Context &context, bool atomic) {
     const std::string profile = profileChosen("").name;  // a missing profile is told before anything is switched
-    applicationApply(context,
-                     {"Switching the firewall on", "Cannot switch the firewall on with profile \"" + profile + "\"",
-                      profile, [] { return FW::VELDFW().fwEnable(); }});
+    const auto heldUp =
+        applicationApply(context, {"Switching the firewall on",
+                                   "Cannot switch the firewall on with profile \"" + profile + "\"", profile,
+                                   [atomic] {
+                                       FW::FwApplyFailure failure;  // is in the log, too
+                                       return atomic ? enableAtomic(failure) : FW::VELDFW().fwEnable();
+                                   },
+                                   atomic});
     context.print("The firewall is on, with profile \"" + profile + "\".");
     if (context.json) {
         Json::Value json;
         json["enabled"] = true;
         json["profile"] = profile;
         json["applied"] = true;
+        json["heldUpMilliseconds"] = static_cast<Json::Int64>(heldUp.count());
         context.printJson(json);
     }
     return STATUS_DONE;
@@ -29,11 +37,12 @@ int enable(const Context &context) {
 }  // namespace
 
 void registerEnable(CLI::App &app, Context &context) {
-    verbAdd(
-        app, context,
-        {"enable", "Switch the firewall on and apply the active profile", "veldfwctl enable",
-         [&context] { return enable(context); }, false,
-         "A profile that cannot be applied leaves the firewall off. The work goes on when the terminal is closed."});
+    const auto atomic = std::make_shared<bool>(false);
+    verbAdd(app, context,
+            {"enable", "Switch the firewall on and apply the active profile", "veldfwctl enable",
+             [&context, atomic] { return enable(context, *atomic); }, false,
+             "A profile that cannot be applied leaves the firewall off. The work goes on when the terminal is closed."})
+        ->add_flag("--atomic", *atomic, ATOMIC_HELP);
 }
 
 }  // namespace veldfwctl

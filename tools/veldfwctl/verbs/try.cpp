@@ -7,6 +7,7 @@
 
 #include "frame/verb.h"
 #include "model/addresses.h"
+#include "system/apply.h"
 #include "system/trialPlace.h"
 #include "system/trialWatch.h"
 
@@ -74,7 +75,8 @@ int start(const Context &context, const Options &options) {
     if (!client.empty() && !addressFromText(client)) {
         throw UsageError("\"" + client + "\" is no address; --client takes one such as 192.0.2.7");
     }
-    trialStart({options.profile, client, options.seconds, options.atomic});
+    const auto heldUp = trialStart({options.profile, client, options.seconds, options.atomic});
+    context.print(heldUpText(heldUp));
     context.print("Profile \"" + options.profile + "\" is in force for " + std::to_string(options.seconds) +
                   " seconds. Open a new connection to see that you still get in, then run \"veldfwctl try --confirm\"; "
                   "otherwise what was before comes back by itself.");
@@ -84,6 +86,7 @@ int start(const Context &context, const Options &options) {
         json["profile"] = options.profile;
         json["client"] = client;
         json["seconds"] = options.seconds;
+        json["heldUpMilliseconds"] = static_cast<Json::Int64>(heldUp.count());
         context.printJson(json);
     }
     return STATUS_DONE;
@@ -133,8 +136,7 @@ void registerTry(CLI::App &app, Context &context) {
         ->capture_default_str();
     verb->add_option("-c,--client", options->client,
                      "Address from which you are connected; by default that of the SSH connection");
-    verb->add_flag("--atomic", options->atomic,
-                   "Replace the rules as a whole, without a moment that drops new traffic");
+    verb->add_flag("--atomic", options->atomic, ATOMIC_HELP);
     verb->add_flag("--confirm", options->confirm, "Keep the profile that is on trial");
     verb->add_flag("--revert", options->revert, "Take it back now");
     verb->add_flag("--status", options->status, "Tell what is on trial; exit status 1 when nothing is");
