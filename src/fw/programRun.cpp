@@ -87,6 +87,11 @@ int runOnce(const std::vector<std::string> &command, const std::string &input, P
         run.message += " (killed by signal " + std::to_string(WTERMSIG(status)) + ")";
         return -1;
     }
+    // iptables-restore takes an input that it cannot read for an empty one, and succeeds. The offset is shared.
+    if (WEXITSTATUS(status) == 0 && lseek(in.get(), 0, SEEK_CUR) != static_cast<off_t>(input.size())) {
+        run.message += "ended before it had read all of its input";
+        return -1;
+    }
     if (run.message.empty() && WEXITSTATUS(status) != 0) {
         run.message = "exited with status " + std::to_string(WEXITSTATUS(status));
     }

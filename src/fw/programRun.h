@@ -9,7 +9,7 @@
 namespace FW {
 
 struct ProgramRun {
-    bool succeeded = false;  ///< started and exited with status 0
+    bool succeeded = false;  ///< started, read all of its input and exited with status 0
     std::string output;      ///< standard output
     std::string message;     ///< standard error, without the line break at its end; or why there is none
 };
