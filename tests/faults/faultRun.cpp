@@ -84,7 +84,7 @@ const std::map<uint64_t, std::vector<int>> &errorTable() {
             {SYS_recvmsg, {ENOBUFS}},
             {SYS_recvfrom, {ENOBUFS}},
             {SYS_setsockopt, {EPERM}},
-            {SYS_getsockopt, {EPERM, ENOENT}},
+            {SYS_getsockopt, {EPERM}},
             {SYS_ioctl, {EIO}},
             {SYS_unlinkat, {EIO}},
             {SYS_renameat2, {EIO, ENOSPC}},
