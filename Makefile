@@ -10,7 +10,7 @@ BENCH_ARGS ?=
 # $(call build,<preset>[,<configure options>[,<build options>]]) configures and builds the preset in build-<preset>.
 build = cmake --preset $(1) --log-level=NOTICE $(2) && cmake --build --preset $(1) --parallel $(JOBS) $(3)
 
-.PHONY: help demo test bench lint format sanitize tsan fuzz install package clean
+.PHONY: help demo test bench lint format sanitize tsan fuzz faults install package clean
 .DEFAULT_GOAL := help
 
 help: ## list the targets
@@ -56,6 +56,11 @@ fuzz: ## fuzz each target for FUZZ_SECONDS (60)
 	scripts/install-dependencies.sh fuzz
 	$(call build,fuzz)
 	scripts/fuzz.sh build-fuzz $(FUZZ_SECONDS)
+
+faults: ## fail each system call of a write and a reload in turn, and kill at each (make test: a part)
+	scripts/install-dependencies.sh test
+	$(call build,dev)
+	VELD_FAULTS=full ctest --preset dev --parallel $(JOBS) --tests-regex '^faults_test' --verbose
 
 install: ## install below DESTDIR in PREFIX (/usr/local)
 	scripts/install-dependencies.sh build
