@@ -36,9 +36,21 @@ public:
         return !refusal;
     }
 
-    /// Keeps what undo() puts back.
-    bool snapshotTake(FwApplyFailure &failure) {
-        const std::string message = tablesSave(snapshot);
+    /// The programs that show whether commit() can succeed and be undone: one that reads everything and commits
+    /// nothing, and those that list the rules in force. None changes anything.
+    std::vector<ProgramCall> trial() const {
+        std::vector<ProgramCall> calls = {{restoreCommand({"--test"}), input.text}};
+        for (const std::string &table : input.tables) {
+            calls.push_back({saveCommand(table), ""});
+        }
+        return calls;
+    }
+
+    /// Takes the results of trial(), from `run` on, and keeps what undo() puts back.
+    /// @param run moves on behind them
+    bool trialRead(std::vector<ProgramRun>::const_iterator &run, FwApplyFailure &failure) {
+        const ProgramRun &tried = *run++;
+        const std::string message = savedRead(run, snapshot);
         if (!message.empty()) {
             failure.family = family;
             failure.message = message;
@@ -46,19 +58,22 @@ public:
             failure.family = family;
             failure.message = "a rule in force holds a line break and could not be put back";
         }
-        return failure.message.empty();
+        return failure.message.empty() && restored(tried, failure);
     }
 
-    /// Lets the program read everything and commit nothing.
-    bool tryOut(FwApplyFailure &failure) const { return restore({"--test"}, input.text, failure); }
-
-    bool commit(FwApplyFailure &failure) const { return restore({}, input.text, failure); }
+    bool commit(FwApplyFailure &failure) const { return restored(programRun(restoreCommand({}), input.text), failure); }
 
     /// Puts back what commit() changed, all or some of it. A failure is only logged: there is nothing left to go back
     /// to.
     void undo() const {
+        std::vector<ProgramCall> saves;
+        for (const std::string &table : input.tables) {
+            saves.push_back({saveCommand(table), ""});
+        }
+        const std::vector<ProgramRun> saved = programsRun(saves);
+        auto run = saved.begin();
         std::string now;
-        std::string message = tablesSave(now);
+        const std::string message = savedRead(run, now);
         if (!message.empty()) {
             FW_LOG_ERR("Failed to list the rules of %s: %s", program.c_str(), message.c_str());
         }
@@ -66,9 +81,9 @@ public:
         if (text.empty()) {
             return;
         }
-        const ProgramRun run = programRun(restoreCommand({"--counters"}), text);
-        if (!run.succeeded) {
-            FW_LOG_ERR("Failed to put the old rules of %s back: %s", program.c_str(), run.message.c_str());
+        const ProgramRun undone = programRun(restoreCommand({"--counters"}), text);
+        if (!undone.succeeded) {
+            FW_LOG_ERR("Failed to put the old rules of %s back: %s", program.c_str(), undone.message.c_str());
         }
     }
 
@@ -86,20 +101,23 @@ private:
         return command;
     }
 
-    /// @return why not, or nothing
-    std::string tablesSave(std::string &saved) const {
-        for (const std::string &table : input.tables) {
-            const ProgramRun run = programRun({program + "-save", "--counters", "--table", table}, "");
-            if (!run.succeeded) {
-                return program + "-save: " + run.message;
-            }
-            saved += run.output;
-        }
-        return "";
+    std::vector<std::string> saveCommand(const std::string &table) const {
+        return {program + "-save", "--counters", "--table", table};
     }
 
-    bool restore(const std::vector<std::string> &options, const std::string &text, FwApplyFailure &failure) const {
-        const ProgramRun run = programRun(restoreCommand(options), text);
+    /// Takes the results of saveCommand() for each table. @return why not, or nothing
+    std::string savedRead(std::vector<ProgramRun>::const_iterator &run, std::string &saved) const {
+        std::string message;
+        for (size_t table = 0; table < input.tables.size(); ++table, ++run) {
+            if (!run->succeeded && message.empty()) {
+                message = program + "-save: " + run->message;
+            }
+            saved += run->output;
+        }
+        return message;
+    }
+
+    bool restored(const ProgramRun &run, FwApplyFailure &failure) const {
         if (run.succeeded) {
             return true;
         }
@@ -150,8 +168,16 @@ private:
 
 /// Both families, up to the commits of both or of none.
 bool allOrNothing(std::vector<FamilyApply> &families, FwApplyFailure &failure) {
-    const auto tryOut = [&](FamilyApply &family) { return family.snapshotTake(failure) && family.tryOut(failure); };
-    if (!std::all_of(families.begin(), families.end(), tryOut)) {
+    // Side by side: each program spends its time reading or printing rules, on one processor.
+    std::vector<ProgramCall> calls;
+    for (const FamilyApply &family : families) {
+        const std::vector<ProgramCall> trial = family.trial();
+        calls.insert(calls.end(), trial.begin(), trial.end());
+    }
+    const std::vector<ProgramRun> runs = programsRun(calls);
+    auto run = runs.begin();
+    const auto tried = [&](FamilyApply &family) { return family.trialRead(run, failure); };
+    if (!std::all_of(families.begin(), families.end(), tried)) {
         return false;
     }
     for (size_t i = 0; i < families.size(); ++i) {

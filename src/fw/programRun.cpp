@@ -12,6 +12,7 @@
 #include <cerrno>
 #include <csignal>
 #include <cstring>
+#include <memory>
 
 #include "utils/descriptor.h"
 
@@ -56,54 +57,80 @@ int spawn(const std::vector<std::string> &command, int in, int out, int err, pid
     return error;
 }
 
-/// @return the exit status; negative, with the reason in `run.message`, when there is none
-int runOnce(const std::vector<std::string> &command, const std::string &input, ProgramRun &run) {
-    const Descriptor in = memoryFile("input");
-    const Descriptor out = memoryFile("output");
-    const Descriptor err = memoryFile("errors");
-    if (!in.isOpen() || !out.isOpen() || !err.isOpen() || !writeAll(in.get(), input) ||
-        lseek(in.get(), 0, SEEK_SET) != 0) {
-        run.message = std::string("no memory for its input and output: ") + std::strerror(errno);
-        return -1;
-    }
-    pid_t process = -1;
-    if (const int error = spawn(command, in.get(), out.get(), err.get(), process); error != 0) {
-        run.message = std::string("cannot be started: ") + std::strerror(error);
-        return -1;
-    }
-    int status = 0;
-    while (waitpid(process, &status, 0) < 0) {
-        if (errno != EINTR) {
-            run.message = std::string("its exit status is lost: ") + std::strerror(errno);
-            return -1;
+/// A program on its way. Its end must be waited for.
+class StartedProgram {
+public:
+    StartedProgram(const std::vector<std::string> &command, const std::string &input)
+        : in(memoryFile("input")), out(memoryFile("output")), err(memoryFile("errors")),
+          inputSize(static_cast<off_t>(input.size())) {
+        if (!in.isOpen() || !out.isOpen() || !err.isOpen() || !writeAll(in.get(), input) ||
+            lseek(in.get(), 0, SEEK_SET) != 0) {
+            reason = std::string("no memory for its input and output: ") + std::strerror(errno);
+        } else if (const int error = spawn(command, in.get(), out.get(), err.get(), process); error != 0) {
+            process = -1;
+            reason = std::string("cannot be started: ") + std::strerror(error);
         }
     }
-    if (!contentRead(out, run.output) || !contentRead(err, run.message)) {
-        run.message = std::string("what it printed is lost: ") + std::strerror(errno);
-        return -1;
+
+    ProgramRun wait() const {
+        ProgramRun run;
+        run.message = reason;
+        if (process < 0) {
+            return run;
+        }
+        int status = 0;
+        while (waitpid(process, &status, 0) < 0) {
+            if (errno != EINTR) {
+                run.message = std::string("its exit status is lost: ") + std::strerror(errno);
+                return run;
+            }
+        }
+        if (!contentRead(out, run.output) || !contentRead(err, run.message)) {
+            run.message = std::string("what it printed is lost: ") + std::strerror(errno);
+            return run;
+        }
+        run.succeeded = status == 0;
+        run.message.erase(run.message.find_last_not_of(" \n") + 1);
+        if (WIFSIGNALED(status)) {
+            run.message += " (killed by signal " + std::to_string(WTERMSIG(status)) + ")";
+        } else if (run.message.empty() && status != 0) {
+            run.message = "exited with status " + std::to_string(WEXITSTATUS(status));
+        }
+        // iptables-restore takes an input that it cannot read for an empty one, and succeeds. The offset is shared.
+        if (run.succeeded && lseek(in.get(), 0, SEEK_CUR) != inputSize) {
+            run.succeeded = false;
+            run.message += "ended before it had read all of its input";
+        }
+        return run;
     }
-    run.message.erase(run.message.find_last_not_of(" \n") + 1);
-    if (WIFSIGNALED(status)) {
-        run.message += " (killed by signal " + std::to_string(WTERMSIG(status)) + ")";
-        return -1;
-    }
-    // iptables-restore takes an input that it cannot read for an empty one, and succeeds. The offset is shared.
-    if (WEXITSTATUS(status) == 0 && lseek(in.get(), 0, SEEK_CUR) != static_cast<off_t>(input.size())) {
-        run.message += "ended before it had read all of its input";
-        return -1;
-    }
-    if (run.message.empty() && WEXITSTATUS(status) != 0) {
-        run.message = "exited with status " + std::to_string(WEXITSTATUS(status));
-    }
-    return WEXITSTATUS(status);
-}
+
+private:
+    Descriptor in;
+    Descriptor out;
+    Descriptor err;
+    off_t inputSize;
+    pid_t process = -1;
+    std::string reason;  ///< why it was not started
+};
 
 }  // namespace
 
 ProgramRun programRun(const std::vector<std::string> &command, const std::string &input) {
-    ProgramRun run;
-    run.succeeded = runOnce(command, input, run) == 0;
-    return run;
+    return StartedProgram(command, input).wait();
+}
+
+std::vector<ProgramRun> programsRun(const std::vector<ProgramCall> &calls) {
+    std::vector<std::unique_ptr<StartedProgram>> started;
+    started.reserve(calls.size());
+    for (const ProgramCall &call : calls) {
+        started.push_back(std::make_unique<StartedProgram>(call.command, call.input));
+    }
+    std::vector<ProgramRun> runs;
+    runs.reserve(calls.size());
+    for (const std::unique_ptr<StartedProgram> &program : started) {
+        runs.push_back(program->wait());
+    }
+    return runs;
 }
 
 }  // namespace FW

@@ -14,8 +14,17 @@ struct ProgramRun {
     std::string message;     ///< standard error, without the line break at its end; or why there is none
 };
 
+/// A program to be run.
+struct ProgramCall {
+    std::vector<std::string> command;  ///< absolute path first
+    std::string input;
+};
+
 /// Runs a program (absolute path first) without a shell and waits for it. It inherits no descriptors beyond 0 to 2.
 ProgramRun programRun(const std::vector<std::string> &command, const std::string &input);
+
+/// Runs all of them at the same time, each as programRun() does, and waits for all. @return the results in order
+std::vector<ProgramRun> programsRun(const std::vector<ProgramCall> &calls);
 
 }  // namespace FW
 
