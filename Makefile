@@ -10,7 +10,7 @@ BENCH_ARGS ?=
 # $(call build,<preset>[,<configure options>[,<build options>]]) configures and builds the preset in build-<preset>.
 build = cmake --preset $(1) --log-level=NOTICE $(2) && cmake --build --preset $(1) --parallel $(JOBS) $(3)
 
-.PHONY: help demo test bench lint format sanitize tsan fuzz faults install package clean
+.PHONY: help demo test bench lint format sanitize tsan fuzz faults install package packagetest clean
 .DEFAULT_GOAL := help
 
 help: ## list the targets
@@ -71,6 +71,9 @@ package: ## build the Debian packages in out/packages
 	scripts/install-dependencies.sh package
 	$(call build,package)
 	cpack --preset package
+
+packagetest: package ## install, use and purge the packages in a clean Debian tree (as root)
+	scripts/test-packages.sh out/packages
 
 clean: ## remove everything that was built
 	rm -rf build-dev build-release build-asan build-tsan build-tidy build-bench build-fuzz build-package out

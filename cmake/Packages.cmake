@@ -40,6 +40,8 @@ set(CPACK_DEBIAN_DATA_PACKAGE_ARCHITECTURE all)
 if(TARGET veldfwctl)
   list(APPEND CPACK_COMPONENTS_ALL tool)
   veld_package(tool veldfwctl admin "Administrator's tool of the firewall" "libveldfirewall1 ${same_version}")
+  set(CPACK_DEBIAN_TOOL_PACKAGE_CONTROL_EXTRA ${PROJECT_SOURCE_DIR}/cmake/packageScripts/postinst
+    ${PROJECT_SOURCE_DIR}/cmake/packageScripts/prerm ${PROJECT_SOURCE_DIR}/cmake/packageScripts/postrm)
 endif()
 
 include(CPack)

@@ -16,7 +16,7 @@ packages_of() {
     lint) packages_of test && echo git clang-format clang-tidy shellcheck ;;
     bench) packages_of demo && echo libbenchmark-dev ;;
     fuzz) echo clang libclang-rt-14-dev ;;
-    package) echo dpkg-dev file ;;
+    package) echo debootstrap dpkg-dev file ;;
     all) for group in test lint bench fuzz package; do packages_of "$group"; done ;;
     *)
       echo "${0##*/}: unknown group \"$1\"; known: build demo test lint bench fuzz package all" >&2
