@@ -8,8 +8,9 @@
 set -euo pipefail
 
 packages=$(realpath "${1:?name the directory of the packages}")
-mirror=${VELD_MIRROR:-$(sed -nE 's/^(deb .*|URIs: *)(https?:[^ ]+).*/\2/p' /etc/apt/sources.list \
-  /etc/apt/sources.list.d/* 2>/dev/null | head -1)}
+# The system has its sources in the one form or the other, so that one of the files is missing.
+sources=$(cat /etc/apt/sources.list /etc/apt/sources.list.d/* 2>/dev/null || true)
+mirror=${VELD_MIRROR:-$(sed -nE 's/^(deb .*|URIs: *)(https?:[^ ]+).*/\2/p;' <<<"$sources" | sed -n 1p)}
 [[ $EUID -eq 0 ]] || { echo "${0##*/}: needs root" >&2; exit 1; }
 shopt -s nullglob
 debs=("$packages"/*.deb)
