@@ -53,8 +53,8 @@ std::string backendOf(const std::string &version) {
     return version.find("legacy") != std::string::npos ? "legacy" : "";
 }
 
-std::vector<Finding> programsJudge(const std::vector<ProgramVersion> &programs) {
-    std::vector<Finding> findings;
+std::vector<Diagnosis> programsJudge(const std::vector<ProgramVersion> &programs) {
+    std::vector<Diagnosis> findings;
     std::map<std::string, std::vector<std::string>> byBackend;
     for (const ProgramVersion &program : programs) {
         if (!program.error.empty()) {
@@ -82,8 +82,8 @@ std::vector<Finding> programsJudge(const std::vector<ProgramVersion> &programs) 
     return findings;
 }
 
-std::vector<Finding> othersJudge(const std::vector<std::string> &listings, const std::string &nftTables,
-                                 const std::string &backend) {
+std::vector<Diagnosis> othersJudge(const std::vector<std::string> &listings, const std::string &nftTables,
+                                   const std::string &backend) {
     std::set<std::string> managers;
     std::set<std::string> unknown;
     const auto see = [&](const std::string &name, const std::string &shown) {
@@ -109,7 +109,7 @@ std::vector<Finding> othersJudge(const std::vector<std::string> &listings, const
             see(name, "nft table " + family + " " + name);
         }
     }
-    std::vector<Finding> findings;
+    std::vector<Diagnosis> findings;
     if (hasFilter && backend == "legacy") {
         findings.push_back({"other rules", Verdict::PROBLEM,
                             "iptables is of the legacy backend, but nft has rules of iptables too; both apply",

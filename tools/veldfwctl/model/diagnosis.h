@@ -15,7 +15,7 @@ enum class Verdict {
     PROBLEM,  ///< the firewall does not work, or not as it should
 };
 
-struct Finding {
+struct Diagnosis {
     std::string item;  ///< what was looked at: "programs"
     Verdict verdict = Verdict::OK;
     std::string text;
@@ -33,13 +33,13 @@ struct ProgramVersion {
 };
 
 /// One finding per program that cannot be run, and one about their backends.
-std::vector<Finding> programsJudge(const std::vector<ProgramVersion> &programs);
+std::vector<Diagnosis> programsJudge(const std::vector<ProgramVersion> &programs);
 
 /// Who else has chains or tables.
 /// @param listings what "iptables -S" and "ip6tables -S" print
 /// @param nftTables what "nft list tables" prints; may be empty
-std::vector<Finding> othersJudge(const std::vector<std::string> &listings, const std::string &nftTables,
-                                 const std::string &backend);
+std::vector<Diagnosis> othersJudge(const std::vector<std::string> &listings, const std::string &nftTables,
+                                   const std::string &backend);
 
 /// Modules that are neither loaded nor can be. Names may have the extension ".ko".
 /// @param loaded names as /proc/modules has them

@@ -24,7 +24,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-using Findings = std::vector<Finding>;
+using Findings = std::vector<Diagnosis>;
 
 constexpr const char *SETUP = "run \"veldfwctl setup\"";
 constexpr const char *PROFILES = "/usr/veld/etc/firewall.d";
@@ -69,7 +69,7 @@ std::string programsExamine(Findings &findings) {
             versions.push_back({program, output.succeeded() ? "" : output.reason(), output.output});
         }
     }
-    for (Finding &finding : programsJudge(versions)) {
+    for (Diagnosis &finding : programsJudge(versions)) {
         findings.push_back(std::move(finding));
     }
     if (access("/usr/veld/sbin/veldnetdtool", X_OK) != 0) {
@@ -103,7 +103,7 @@ void chainsExamine(Findings &findings, const std::string &backend) {
     }
     const bool hasNft = access(NFT, X_OK) == 0;
     const std::string tables = hasNft ? programRun({NFT, "list", "tables"}).output : "";
-    for (Finding &finding : othersJudge(listings, tables, backend)) {
+    for (Diagnosis &finding : othersJudge(listings, tables, backend)) {
         findings.push_back(std::move(finding));
     }
     if (backend == "nft" && !linesOf("/proc/net/ip_tables_names").empty()) {
@@ -224,12 +224,12 @@ int doctor(const Context &context) {
     countriesExamine(findings, hasCountries);
     locksExamine(findings);
     const auto problems = std::count_if(findings.begin(), findings.end(),
-                                        [](const Finding &finding) { return finding.verdict == Verdict::PROBLEM; });
+                                        [](const Diagnosis &finding) { return finding.verdict == Verdict::PROBLEM; });
     Table table{{"ITEM", "", "FOUND", "WHAT TO DO"}, {}};
     Json::Value json;
     json["problems"] = static_cast<Json::Int64>(problems);
     json["findings"] = Json::arrayValue;
-    for (const Finding &finding : findings) {
+    for (const Diagnosis &finding : findings) {
         const bool isBad = finding.verdict == Verdict::PROBLEM;
         const char *verdict = isBad ? "problem" : finding.verdict == Verdict::NOTE ? "note" : "ok";
         const Shade shade = isBad ? Shade::BAD : finding.verdict == Verdict::NOTE ? Shade::FAINT : Shade::GOOD;
