@@ -115,7 +115,7 @@ const std::map<uint64_t, std::vector<int>> &errorTable() {
 
 class Tracer {
 public:
-    Tracer(long faultAt, int faultError) : at(faultAt), error(faultError) {}
+    Tracer(std::optional<FaultPoint> faultAt, int faultError) : at(faultAt), error(faultError) {}
 
     FaultRun run(const std::function<int()> &function) {
         child = startChild([&] {
@@ -132,7 +132,7 @@ public:
             kill(child, SIGKILL);
             throw std::runtime_error("processes may not be traced here");
         }
-        traced[child] = {0, 0, false};
+        traced[child] = {};
         ptrace(PTRACE_SYSCALL, child, nullptr, 0);
         while (!traced.empty()) {
             const pid_t process = waitpid(-1, &status, __WALL);
@@ -151,6 +151,7 @@ public:
 private:
     struct Traced {
         int ordinal = 0;
+        int calls = 0;
         uint64_t number = 0;
         bool isStruck = false;
     };
@@ -186,8 +187,9 @@ private:
         }
         if (info.op != PTRACE_SYSCALL_INFO_ENTRY || errorTable().count(info.entry.nr) == 0)
             return true;
-        result.points.push_back({state.ordinal, info.entry.nr});
-        if (static_cast<long>(result.points.size()) - 1 != at)
+        const FaultPoint point = {state.ordinal, state.calls++, info.entry.nr};
+        result.points.push_back(point);
+        if (!at || at->process != point.process || at->index != point.index)
             return true;
         if (error == killProcess) {
             kill(process, SIGKILL);
@@ -199,7 +201,7 @@ private:
         return true;
     }
 
-    const long at;
+    const std::optional<FaultPoint> at;
     const int error;
     pid_t child = -1;
     int started = 0;
@@ -210,7 +212,7 @@ private:
 
 }  // namespace
 
-FaultRun runWithFault(const std::function<int()> &function, long at, int error) {
+FaultRun runWithFault(const std::function<int()> &function, std::optional<FaultPoint> at, int error) {
     return Tracer(at, error).run(function);
 }
 

@@ -6,6 +6,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -14,21 +15,22 @@ namespace veldtest {
 /// One system call of a run.
 struct FaultPoint {
     int process = 0;      ///< 0: the child itself; then its descendants in the order of their starts
+    int index = 0;        ///< among the calls of the process: processes that run side by side mix as they like
     uint64_t number = 0;  ///< of the system call
 };
 
 struct FaultRun {
     int status = 0;  ///< of the child: the function's result, 128 + signal when killed, 125 when it threw
-    std::vector<FaultPoint> points;  ///< all calls that count, in their order; up to the fault the same in every run
+    std::vector<FaultPoint> points;  ///< all calls that count
 };
 
 constexpr int killProcess = -1;
 
 /// Calls that cannot fail, or only in ways that no caller can see, do not count.
-/// @param at index of the call that the fault strikes, -1 for none
+/// @param at the call that the fault strikes
 /// @param error its errno; killProcess: the process that makes the call is killed there
 /// Throws std::runtime_error when processes may not be traced, or calls not be replaced, here.
-FaultRun runWithFault(const std::function<int()> &function, long at = -1, int error = killProcess);
+FaultRun runWithFault(const std::function<int()> &function, std::optional<FaultPoint> at = {}, int error = killProcess);
 
 /// The errors that apply to a system call.
 std::vector<int> errorsOf(uint64_t number);

@@ -32,11 +32,10 @@ size_t seed() {
 }
 
 struct Fault {
-    long at;
-    int error;  ///< or killProcess
     FaultPoint point;
+    int error;  ///< or killProcess
     std::string text() const {
-        return "call " + std::to_string(at) + ", number " + std::to_string(point.number) + " of process " +
+        return "call " + std::to_string(point.index) + ", number " + std::to_string(point.number) + ", of process " +
                std::to_string(point.process) + (error == killProcess ? " killed" : std::string(": ") + strerror(error));
     }
 };
@@ -48,14 +47,13 @@ std::vector<Fault> faultsOf(const std::function<int()> &operation, size_t stride
     const FaultRun undisturbed = runWithFault(operation);
     EXPECT_EQ(undisturbed.status, 0);
     std::array<size_t, 2> counts = {seed(), seed()};
-    for (size_t i = 0; i < undisturbed.points.size(); ++i) {
-        const FaultPoint &point = undisturbed.points[i];
+    for (const FaultPoint &point : undisturbed.points) {
         std::vector<int> errors = errorsOf(point.number);
         errors.push_back(killProcess);
         for (const int error : errors) {
             const bool ofProgram = point.process != 0;
             if (isFull() || counts.at(ofProgram ? 1 : 0)++ % (ofProgram ? strideOfPrograms : strideOfOwn) == 0)
-                faults.push_back({static_cast<long>(i), error, point});
+                faults.push_back({point, error});
         }
     }
     return faults;
@@ -78,7 +76,7 @@ int asStatus(const std::function<bool()> &operation) {
 
 #define SKIP_UNLESS_TRACEABLE()                                                                                        \
     try {                                                                                                              \
-        runWithFault([] { return close(open("/", O_RDONLY | O_CLOEXEC)); }, 0, EACCES);                                \
+        runWithFault([] { return close(open("/", O_RDONLY | O_CLOEXEC)); }, FaultPoint(), EACCES);                     \
     } catch (const std::runtime_error &error) {                                                                        \
         GTEST_SKIP() << error.what();                                                                                  \
     }
@@ -108,7 +106,7 @@ TEST_F(StoreFaults, LeaveTheOldOrTheNewDocumentAfterADump) {
     for (const Fault &fault : faults) {
         SCOPED_TRACE(fault.text());
         ASSERT_TRUE(FW::jsonFileDump(document("old"), path));
-        const FaultRun run = runWithFault(dump, fault.at, fault.error);
+        const FaultRun run = runWithFault(dump, fault.point, fault.error);
         const std::string name = stored();
         EXPECT_TRUE(name == "new" || (name == "old" && run.status != 0)) << name << " after " << run.status;
         outcomes[(run.status == 0 ? "succeeded" : "failed") + std::string(" and ") + name] += 1;
@@ -144,7 +142,7 @@ TEST_F(StoreFaults, LeaveTheOldOrTheNewProfileAfterAnEdit) {
     for (const Fault &fault : faults) {
         SCOPED_TRACE(fault.text());
         ASSERT_TRUE(start());
-        const FaultRun run = runWithFault(edit, fault.at, fault.error);
+        const FaultRun run = runWithFault(edit, fault.point, fault.error);
         const std::string port = stored();
         // A profile whose document cannot be read while names are looked up does not exist: then a second document is
         // made, and the first goes on to count.
@@ -212,7 +210,7 @@ TEST_P(ReloadFaults, LeaveTheOldOrTheNewRulesAfterAnAtomicReload) {
         ASSERT_EQ(applied("default"), oldRules) << "the next reload: " << log.text();
         log.clear();
         activate("other");
-        const FaultRun run = runWithFault(reload, fault.at, fault.error);
+        const FaultRun run = runWithFault(reload, fault.point, fault.error);
         const auto left = rules();
         if (run.status == 0) {
             EXPECT_TRUE(left == newRules) << log.text();
@@ -242,7 +240,7 @@ TEST_P(ReloadFaults, ArePutRightByTheNextReloadWhenTheSpecifiedOneIsKilled) {
         if (fault.point.process != 0)
             continue;
         SCOPED_TRACE(fault.text());
-        const FaultRun run = runWithFault(reload, fault.at, killProcess);
+        const FaultRun run = runWithFault(reload, fault.point, killProcess);
         EXPECT_EQ(run.status, 128 + SIGKILL);
         outcomes[rules() == expected ? "killed with all rules" : "killed half-way"] += 1;
         EXPECT_TRUE(execLockIsFree());
