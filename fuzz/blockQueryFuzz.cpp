@@ -155,7 +155,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
     query.protocol = static_cast<FW::FW_PORT_PROTOCOL>(1 + bytes.below(4));
     const Ports asked = drawPorts(bytes);
     query.port = asked.text;
-    const std::string adapter = bytes.oneOf<std::string>({"", "global", "eth0", "pppoe", "absent"});
+    const auto adapter = bytes.oneOf<std::string>({"", "global", "eth0", "pppoe", "absent"});
     FW::FWPROFILE profile;
     for (const std::string &name : adapters) {
         const int policy = bytes.below(4);

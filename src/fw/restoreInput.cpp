@@ -95,8 +95,7 @@ void lineAppend(RestoreInput &input, const std::string &line, size_t command = R
 }
 
 bool isFirewallChain(const std::string &table, const std::string &chain) {
-    return table == FILTER_TABLE &&
-           std::find(FW_CHAINS.begin(), FW_CHAINS.end(), chain) != FW_CHAINS.end();
+    return table == FILTER_TABLE && std::find(FW_CHAINS.begin(), FW_CHAINS.end(), chain) != FW_CHAINS.end();
 }
 
 void sectionAppend(RestoreInput &input, const std::string &table, const std::vector<Append> &appends) {

@@ -102,7 +102,8 @@ private:
         while (!stopAccepting) {
             pollfd events[] = {
                 {allowed, POLLIN, 0}, {denied, POLLIN, 0}, {transfers, POLLIN, 0}, {transferred, POLLIN, 0}};
-            poll(events, 4, 20);
+            if (poll(events, 4, 20) < 0)
+                continue;
             for (int accepted = accept4(allowed, nullptr, nullptr, SOCK_CLOEXEC); accepted >= 0;
                  accepted = accept4(allowed, nullptr, nullptr, SOCK_CLOEXEC))
                 drop(accepted);
