@@ -203,7 +203,8 @@ size_t profilePrepare(const veldtest::NetworkNamespace &space, size_t rules) {
 }
 
 ApplyCost applyIn(const veldtest::NetworkNamespace &space, const std::string &way) {
-    const veldtest::ProgramResult result = space.runProgram({"/proc/self/exe", "--way", way});
+    veldtest::ProgramResult result;
+    space.run([&] { result = veldtest::runProgram({"/proc/self/exe", "--way", way}); });
     ApplyCost cost;
     require(result.succeeded() &&
                 std::sscanf(result.errors.c_str(), "%lf %ld", &cost.milliseconds, &cost.peakKilobytes) == 2,

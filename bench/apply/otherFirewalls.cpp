@@ -43,8 +43,14 @@ std::vector<PortRule> portRules(size_t count) {
     return rules;
 }
 
+veldtest::ProgramResult runIn(const veldtest::NetworkNamespace &space, const std::vector<std::string> &command) {
+    veldtest::ProgramResult result;
+    space.run([&] { result = veldtest::runProgram(command); });
+    return result;
+}
+
 std::string runShell(const veldtest::NetworkNamespace &space, const std::string &command) {
-    const veldtest::ProgramResult result = space.runProgram({"sh", "-c", command});
+    const veldtest::ProgramResult result = runIn(space, {"sh", "-c", command});
     if (!result.succeeded()) {
         throw std::runtime_error(command + ": " + result.errors + result.output);
     }
@@ -141,7 +147,7 @@ Firewalld::Firewalld(const veldtest::NetworkNamespace &space, size_t kernelRules
     m_bus = startDaemon(space, "exec dbus-daemon --system --nofork --nopidfile", "/run/dbus.log");
     m_daemon = startDaemon(space, "exec firewalld --nofork --nopid", DAEMON_LOG);
     const auto deadline = std::chrono::steady_clock::now() + DAEMON_START_TIME;
-    while (!space.runProgram({"firewall-cmd", "--state"}).succeeded()) {
+    while (!runIn(space, {"firewall-cmd", "--state"}).succeeded()) {
         if (std::chrono::steady_clock::now() > deadline) {
             throw std::runtime_error(std::string("firewalld does not start: ") + veldtest::readFile(DAEMON_LOG));
         }

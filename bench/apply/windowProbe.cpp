@@ -3,8 +3,8 @@
 #include "windowProbe.h"
 
 #include <arpa/inet.h>
+#include <linux/tcp.h>
 #include <netinet/in.h>
-#include <netinet/tcp.h>
 #include <poll.h>
 #include <pthread.h>
 #include <sys/socket.h>
@@ -227,7 +227,8 @@ WindowResult WindowProbe::stop() {
     tcp_info info = {};
     socklen_t size = sizeof(info);
     getsockopt(m_transferOut->handle, IPPROTO_TCP, TCP_INFO, &info, &size);
-    result.retransmissions = info.tcpi_total_retrans;
+    // Without those that the receiver already had: sent again because an acknowledgement came late.
+    result.retransmissions = info.tcpi_total_retrans - std::min(info.tcpi_total_retrans, info.tcpi_dsack_dups);
 
     std::vector<int64_t> intervals;
     for (size_t tick = 1; tick < m_sent.size(); ++tick) {

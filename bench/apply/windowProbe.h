@@ -33,7 +33,7 @@ struct WindowResult {
     uint64_t allowedLost = 0;      ///< packets to the allowed port that did not arrive
     double window = 0;             ///< longest time from a lost one to the next that arrived, of either family
     uint64_t deniedPassed = 0;     ///< packets to the denied port that arrived
-    uint64_t retransmissions = 0;  ///< of the established transfer: a lost packet shows here
+    uint64_t retransmissions = 0;  ///< of lost packets of the established transfer
     double longestGap = 0;         ///< of the established transfer: between two arrivals
 };
 
