@@ -6,15 +6,17 @@ PREFIX ?= /usr/local
 DESTDIR ?=
 FUZZ_SECONDS ?= 60
 BENCH_ARGS ?=
+BENCH_APPLY_ARGS ?=
+SOAK_SECONDS ?= 240
 
 # $(call build,<preset>[,<configure options>[,<build options>]]) configures and builds the preset in build-<preset>.
 build = cmake --preset $(1) --log-level=NOTICE $(2) && cmake --build --preset $(1) --parallel $(JOBS) $(3)
 
-.PHONY: help demo test bench lint format sanitize tsan fuzz faults install package packagetest clean
+.PHONY: help demo test bench lint format sanitize tsan fuzz faults install package packagetest clean soak bench-apply
 .DEFAULT_GOAL := help
 
 help: ## list the targets
-	@sed -nE 's/^([a-z]+):.*## (.*)/  make \1\t\2/p' $(MAKEFILE_LIST) | expand -t 18
+	@sed -nE 's/^([a-z-]+):.*## (.*)/  make \1\t\2/p' $(MAKEFILE_LIST) | expand -t 20
 
 demo: ## install what is needed, build, and show the firewall at work in a sandbox
 	scripts/install-dependencies.sh demo
@@ -26,11 +28,23 @@ test: ## install what is needed, build, and run all tests
 	$(call build,dev)
 	ctest --preset dev --parallel $(JOBS)
 
+soak: ## reloads, edits, queries, a neighbour and a held lock at once, for SOAK_SECONDS (240)
+	scripts/install-dependencies.sh test
+	$(call build,dev,,--target veld_soak)
+	build-dev/tests/soak/veld_soak --seconds=$(SOAK_SECONDS)
+
 bench: ## measure; prints a table, writes out/bench.json (BENCH_ARGS=--smoke: only a quick run)
 	scripts/install-dependencies.sh bench
 	$(call build,bench)
 	mkdir -p out
 	build-bench/bench/veld_bench --benchmark_out=out/bench.json --benchmark_out_format=json $(BENCH_ARGS)
+
+bench-apply: ## measure each way of applying a profile (half an hour); writes out/apply.json and out/reload.svg
+	scripts/install-dependencies.sh bench
+	$(call build,bench,,--target veld_bench_apply)
+	mkdir -p out
+	build-bench/bench/apply/veld_bench_apply --out=out/apply.json $(BENCH_APPLY_ARGS)
+	scripts/plot-apply.py out/apply.json out/reload.svg
 
 lint: ## check format, static analysis (clang-tidy) and scripts
 	scripts/install-dependencies.sh lint

@@ -14,7 +14,7 @@ packages_of() {
     demo) echo iptables iproute2 kmod netbase ;;
     test) packages_of demo && echo libgtest-dev libgmock-dev ;;
     lint) packages_of test && echo git clang-format clang-tidy shellcheck ;;
-    bench) packages_of demo && echo libbenchmark-dev ;;
+    bench) packages_of demo && echo libbenchmark-dev python3 ;;
     fuzz) echo clang libclang-rt-14-dev ;;
     package) echo debootstrap dpkg-dev file ;;
     all) for group in test lint bench fuzz package; do packages_of "$group"; done ;;
