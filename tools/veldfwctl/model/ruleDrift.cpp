@@ -12,7 +12,7 @@ namespace {
 
 /// The longest rising subsequence of the positions: which of them are in it.
 std::vector<bool> longestRising(const std::vector<size_t> &positions) {
-    constexpr size_t NONE = static_cast<size_t>(-1);
+    constexpr auto NONE = static_cast<size_t>(-1);
     std::vector<size_t> ends;  // index of the lowest end of a rising sequence of that length
     std::vector<size_t> before(positions.size(), NONE);
     for (size_t i = 0; i < positions.size(); ++i) {

@@ -142,7 +142,7 @@ CallResult trialAdopt(const TrialRecord &record) {
 }
 
 CallResult trialEnforce(const TrialRecord &record) {
-    const CallResult result = limitedCall([&record] {
+    CallResult result = limitedCall([&record] {
         FW::VELDFW firewall;
         if (isEnabled()) {
             return record.atomic ? firewall.fwReloadAtomic(true) : firewall.fwReload(true);
