@@ -189,8 +189,11 @@ private:
             return true;
         const FaultPoint point = {state.ordinal, state.calls++, info.entry.nr};
         result.points.push_back(point);
-        if (!at || at->process != point.process || at->index != point.index)
+        // Memory is not taken at the same points in every run: then it is the next call of that kind.
+        const bool isMet = at && at->process == point.process && at->index <= point.index && at->number == point.number;
+        if (!isMet || result.wasStruck)
             return true;
+        result.wasStruck = true;
         if (error == killProcess) {
             kill(process, SIGKILL);
             return false;

@@ -20,14 +20,15 @@ struct FaultPoint {
 };
 
 struct FaultRun {
-    int status = 0;  ///< of the child: the function's result, 128 + signal when killed, 125 when it threw
+    int status = 0;          ///< of the child: the function's result, 128 + signal when killed, 125 when it threw
+    bool wasStruck = false;  ///< the fault's point was reached
     std::vector<FaultPoint> points;  ///< all calls that count
 };
 
 constexpr int killProcess = -1;
 
 /// Calls that cannot fail, or only in ways that no caller can see, do not count.
-/// @param at the call that the fault strikes
+/// @param at the call that the fault strikes (or the next one of its process that has the same number)
 /// @param error its errno; killProcess: the process that makes the call is killed there
 /// Throws std::runtime_error when processes may not be traced, or calls not be replaced, here.
 FaultRun runWithFault(const std::function<int()> &function, std::optional<FaultPoint> at = {}, int error = killProcess);
