@@ -158,6 +158,19 @@ long ownPeakKilobytes() {
     return 0;
 }
 
+rusage usage(int whose) {
+    rusage result = {};
+    getrusage(whose, &result);
+    return result;
+}
+
+double processorMilliseconds(const rusage &used) {
+    const auto milliseconds = [](const timeval &time) {
+        return static_cast<double>(time.tv_sec) * 1e3 + static_cast<double>(time.tv_usec) / 1e3;
+    };
+    return milliseconds(used.ru_utime) + milliseconds(used.ru_stime);
+}
+
 }  // namespace
 
 void installationPrepare() {
@@ -206,8 +219,8 @@ ApplyCost applyIn(const veldtest::NetworkNamespace &space, const std::string &wa
     veldtest::ProgramResult result;
     space.run([&] { result = veldtest::runProgram({"/proc/self/exe", "--way", way}); });
     ApplyCost cost;
-    require(result.succeeded() &&
-                std::sscanf(result.errors.c_str(), "%lf %ld", &cost.milliseconds, &cost.peakKilobytes) == 2,
+    require(result.succeeded() && std::sscanf(result.errors.c_str(), "%lf %lf %ld", &cost.milliseconds,
+                                              &cost.processorMilliseconds, &cost.peakKilobytes) == 3,
             way + ": exit status " + std::to_string(result.status) + ": " + result.errors + result.output);
     return cost;
 }
@@ -216,12 +229,13 @@ int processOfWay(const std::string &way) {
     try {
         require(veldtest::pathExists(WORK), "not in the sandbox of the benchmark");
         const std::function<void()> action = actionOf(way);
+        const double before = processorMilliseconds(usage(RUSAGE_SELF));
         const auto start = std::chrono::steady_clock::now();
         action();
         const std::chrono::duration<double, std::milli> time = std::chrono::steady_clock::now() - start;
-        rusage children = {};
-        getrusage(RUSAGE_CHILDREN, &children);
-        std::fprintf(stderr, "%f %ld\n", time.count(), std::max(ownPeakKilobytes(), children.ru_maxrss));
+        const rusage children = usage(RUSAGE_CHILDREN);
+        const double processor = processorMilliseconds(usage(RUSAGE_SELF)) - before + processorMilliseconds(children);
+        std::fprintf(stderr, "%f %f %ld\n", time.count(), processor, std::max(ownPeakKilobytes(), children.ru_maxrss));
         return 0;
     } catch (const std::exception &error) {
         std::fprintf(stderr, "%s\n", error.what());

@@ -20,7 +20,8 @@ inline constexpr const char *FIREWALLD_RELOAD = "firewall-cmd --reload";
 
 struct ApplyCost {
     double milliseconds = 0;
-    long peakKilobytes = 0;  ///< resident, of the largest process
+    double processorMilliseconds = 0;  ///< of the process and its children; a daemon's is not in it
+    long peakKilobytes = 0;            ///< resident, of the largest process
 };
 
 /// Makes the sandbox an installation of the library. Before anything else.

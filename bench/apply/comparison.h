@@ -15,6 +15,7 @@ struct ComparisonPlan {
     std::vector<size_t> sizes = {10, 100, 1000};  ///< profile rules
     int rounds = 9;                               ///< of each way
     int slowRounds = 3;                           ///< of a way that takes longer than two seconds
+    bool oneByOne = true;                         ///< the ways that change rule by rule too
     int continuityReloads = 100;
     size_t continuityRules = 1000;
 };
