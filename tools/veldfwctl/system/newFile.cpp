@@ -60,7 +60,7 @@ void fileReplace(const std::string &path, const std::string &text) {
 
 std::string rescueFileWrite(const std::string &text) {
     for (const char *pattern : {"/var/tmp/veldfwctl-backup.XXXXXX", "/tmp/veldfwctl-backup.XXXXXX"}) {
-        if (const std::string path = newFileWrite(pattern, text); !path.empty()) {
+        if (std::string path = newFileWrite(pattern, text); !path.empty()) {
             return path;
         }
     }
