@@ -590,7 +590,8 @@ bool VELDFW_PROFILE::profileAddServToReserve(const std::string &adapter, const s
         FW_LOG_ERR("Failed to profileEnum()");
         return false;
     }
-    for (auto &[name, stored] : profiles) {
+    for (auto &entry : profiles) {
+        StoredProfile &stored = entry.second;
         serviceReserve(stored.profile, adapter, servName, policy);
         if (!FW_RUN_OR_LOG([&] { return storedProfileSave(std::move(stored)); })) {
             FW_LOG_ERR("Failed to set profile");
@@ -610,10 +611,11 @@ bool VELDFW_PROFILE::profileRemoveServ(const std::string &servName) {
         FW_LOG_ERR("Failed to profileEnum()");
         return false;
     }
-    for (auto &[name, stored] : profiles) {
+    for (auto &entry : profiles) {
+        StoredProfile &stored = entry.second;
         serviceRemove(stored.profile, servName);
         if (!FW_RUN_OR_LOG([&] { return storedProfileSave(std::move(stored)); })) {
-            FW_LOG_ERR("Failed to profile set [%s]", name.c_str());
+            FW_LOG_ERR("Failed to profile set [%s]", entry.first.c_str());
             return false;
         }
     }
@@ -632,12 +634,13 @@ bool VELDFW_PROFILE::profileChangeAdapter(const std::string &oldAdapter, const s
         return false;
     }
     bool reloadDue = false;
-    for (auto &[name, stored] : profiles) {
-        if (adapterRename(stored.profile, oldAdapter, newAdapter) && name == activeProfile) {
+    for (auto &entry : profiles) {
+        StoredProfile &stored = entry.second;
+        if (adapterRename(stored.profile, oldAdapter, newAdapter) && entry.first == activeProfile) {
             reloadDue = true;
         }
         if (!FW_RUN_OR_LOG([&] { return storedProfileSave(std::move(stored)); })) {
-            FW_LOG_ERR("Failed to profile set [%s]", name.c_str());
+            FW_LOG_ERR("Failed to profile set [%s]", entry.first.c_str());
             return false;
         }
     }
