@@ -32,7 +32,8 @@ endmacro()
 set(same_version "(= ${PROJECT_VERSION})")
 veld_package(Library libveldfirewall1 libs "${PROJECT_DESCRIPTION}"
   "libveldplatform1 (>= ${PROJECT_VERSION}), veldfirewall-common (>= ${PROJECT_VERSION}), iptables")
-veld_package(Runtime libveldplatform1 libs "Stand-ins for the storage appliance's system libraries" "")
+veld_package(Runtime libveldplatform1 libs "Stand-ins for the storage appliance's system libraries"
+  "libkmod2")  # opened while running, so dpkg-shlibdeps does not see it
 veld_package(Development libveldfirewall-dev libdevel "${PROJECT_DESCRIPTION} (development files)"
   "libveldfirewall1 ${same_version}, libveldplatform1 ${same_version}, libjsoncpp-dev, pkg-config")
 veld_package(data veldfirewall-common admin "Profile, service definitions and module list of the firewall" "")
