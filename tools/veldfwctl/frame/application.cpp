@@ -46,7 +46,7 @@ int applicationRun(int argc, char **argv) {
     app.require_subcommand(1);
     app.footer("Exit status: 0 done, 1 the answer is no, 2 wrong usage, 3 failed.\n"
                "\"veldfwctl VERB --help\" tells more about a verb.");
-    registerAllVerbs(app, context);
+    registerVerbs(app, context, argc > 1 ? argv[1] : "");
     try {
         app.parse(argc, argv);
     } catch (const CLI::Success &success) {  // --help, --version

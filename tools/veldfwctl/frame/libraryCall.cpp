@@ -167,6 +167,9 @@ std::string messagesJoin(const std::vector<std::string> &messages) {
 }
 
 std::vector<std::string> logMessagesParse(const std::string &text) {
+    if (text.empty()) {  // as after most calls; to build the expressions takes longer than many a call
+        return {};
+    }
     static const std::regex start("^veldfwctl(\\[[0-9]+\\])?: ");
     static const std::regex place("^[A-Za-z0-9_.]+:[0-9]+ ");
     std::vector<std::string> messages;

@@ -2,48 +2,29 @@
 // The firewall's chains as they are in the kernel.
 #include "system/kernelState.h"
 
-#include <veld/core.h>
-
-#include <cstdio>
-
-#include "frame/libraryCall.h"
-
 namespace veldfwctl {
 
 namespace {
 
-std::string readAll(FILE *pipe) {
-    std::string text;
-    char buffer[4096];
-    size_t count = 0;
-    while ((count = fread(buffer, 1, sizeof buffer, pipe)) > 0) {
-        text.append(buffer, count);
-    }
-    return text;
-}
-
-FILE *listingStart(const char *program) {
-    return VLIBCPopen(program, "r", "-w", "-v", "-S", static_cast<char *>(nullptr));
+std::future<ProgramOutput> listingStart(const char *program) {
+    return std::async(std::launch::async, [program] { return programRun({program, "-w", "-v", "-S"}); });
 }
 
 }  // namespace
 
-KernelState kernelStateRead() {
+KernelStateQuery::KernelStateQuery() : v4(listingStart(IPTABLES)), v6(listingStart(IP6TABLES)) {}
+
+KernelState KernelStateQuery::answer() {
     KernelState state;
-    const CallResult result = libraryCall([&state] {
-        FILE *v4 = listingStart("/sbin/iptables");
-        FILE *v6 = listingStart("/sbin/ip6tables");
-        bool succeeded = v4 != nullptr && v6 != nullptr;
-        for (const auto &[pipe, chains] : {std::pair(v4, &state.v4), std::pair(v6, &state.v6)}) {
-            if (pipe != nullptr) {
-                *chains = kernelChainsParse(readAll(pipe));
-                succeeded = VLIBCPclose(pipe) == 0 && succeeded;
-            }
+    const ProgramOutput outputV4 = v4.get();
+    const ProgramOutput outputV6 = v6.get();
+    for (const auto &[program, output, chains] :
+         {std::tuple(IPTABLES, &outputV4, &state.v4), std::tuple(IP6TABLES, &outputV6, &state.v6)}) {
+        if (output->succeeded()) {
+            *chains = kernelChainsParse(output->output);
+        } else {
+            state.error += (state.error.empty() ? "" : "; ") + std::string(program) + ": " + output->reason();
         }
-        return succeeded;
-    });
-    if (!result.succeeded) {
-        state.error = result.messages.empty() ? "iptables failed" : messagesJoin(result.messages);
     }
     return state;
 }

@@ -3,10 +3,12 @@
 #ifndef VELDFWCTL_KERNELSTATE_H
 #define VELDFWCTL_KERNELSTATE_H
 
+#include <future>
 #include <map>
 #include <string>
 
 #include "model/kernelChains.h"
+#include "system/program.h"
 
 namespace veldfwctl {
 
@@ -16,8 +18,18 @@ struct KernelState {
     std::string error;  ///< why nothing is known; empty when all was read
 };
 
-/// Asks iptables and ip6tables, both at once.
-KernelState kernelStateRead();
+/// Asks iptables and ip6tables, both at once, while the caller does something else.
+class KernelStateQuery {
+public:
+    /// Starts the two programs.
+    KernelStateQuery();
+    /// Waits for what they tell. To be called once.
+    KernelState answer();
+
+private:
+    std::future<ProgramOutput> v4;
+    std::future<ProgramOutput> v6;
+};
 
 }  // namespace veldfwctl
 

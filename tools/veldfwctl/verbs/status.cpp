@@ -115,9 +115,10 @@ void statusPrint(const Context &context, const Settings &settings, const std::ve
 }
 
 int status(const Context &context) {
+    KernelStateQuery query;  // first: the programs take longer than all the rest
     const Settings settings = settingsRead();
     const std::vector<AdapterSummary> adapters = adapterSummaries(profileChosen(""));
-    const KernelState kernel = kernelStateRead();
+    const KernelState kernel = query.answer();
     const Families families = {{"IPv4", &kernel.v4}, {"IPv6", &kernel.v6}};
     if (context.json) {
         context.printJson(statusJson(settings, adapters, kernel, families));
