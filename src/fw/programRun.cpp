@@ -30,13 +30,27 @@ bool contentRead(const Descriptor &file, std::string &text) {
     return lseek(file.get(), 0, SEEK_SET) == 0 && readAll(file.get(), text);
 }
 
-int spawn(const std::vector<std::string> &command, int in, int out, int err, pid_t &process) {
+/// The environment of this process with the call's setting in front, where it counts.
+std::vector<char *> environmentOf(const ProgramCall &call) {
+    std::vector<char *> environment;
+    if (call.setting != nullptr) {
+        environment.push_back(const_cast<char *>(call.setting));
+    }
+    for (char **entry = environ; *entry != nullptr; ++entry) {
+        environment.push_back(*entry);
+    }
+    environment.push_back(nullptr);
+    return environment;
+}
+
+int spawn(const ProgramCall &call, int in, int out, int err, pid_t &process) {
     std::vector<char *> arguments;
-    arguments.reserve(command.size() + 1);
-    for (const std::string &argument : command) {
+    arguments.reserve(call.command.size() + 1);
+    for (const std::string &argument : call.command) {
         arguments.push_back(const_cast<char *>(argument.c_str()));
     }
     arguments.push_back(nullptr);
+    std::vector<char *> environment = environmentOf(call);
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
     posix_spawn_file_actions_adddup2(&actions, in, STDIN_FILENO);
@@ -51,7 +65,7 @@ int spawn(const std::vector<std::string> &command, int in, int out, int err, pid
     sigemptyset(&signals);
     posix_spawnattr_setsigmask(&attributes, &signals);
     posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETSIGMASK);
-    const int error = posix_spawn(&process, arguments[0], &actions, &attributes, arguments.data(), environ);
+    const int error = posix_spawn(&process, arguments[0], &actions, &attributes, arguments.data(), environment.data());
     posix_spawnattr_destroy(&attributes);
     posix_spawn_file_actions_destroy(&actions);
     return error;
@@ -60,13 +74,13 @@ int spawn(const std::vector<std::string> &command, int in, int out, int err, pid
 /// A program on its way. Its end must be waited for.
 class StartedProgram {
 public:
-    StartedProgram(const std::vector<std::string> &command, const std::string &input)
+    explicit StartedProgram(const ProgramCall &call)
         : in(memoryFile("input")), out(memoryFile("output")), err(memoryFile("errors")),
-          inputSize(static_cast<off_t>(input.size())) {
-        if (!in.isOpen() || !out.isOpen() || !err.isOpen() || !writeAll(in.get(), input) ||
+          inputSize(static_cast<off_t>(call.input.size())) {
+        if (!in.isOpen() || !out.isOpen() || !err.isOpen() || !writeAll(in.get(), call.input) ||
             lseek(in.get(), 0, SEEK_SET) != 0) {
             reason = std::string("no memory for its input and output: ") + std::strerror(errno);
-        } else if (const int error = spawn(command, in.get(), out.get(), err.get(), process); error != 0) {
+        } else if (const int error = spawn(call, in.get(), out.get(), err.get(), process); error != 0) {
             process = -1;
             reason = std::string("cannot be started: ") + std::strerror(error);
         }
@@ -115,15 +129,15 @@ private:
 
 }  // namespace
 
-ProgramRun programRun(const std::vector<std::string> &command, const std::string &input) {
-    return StartedProgram(command, input).wait();
+ProgramRun programRun(const ProgramCall &call) {
+    return StartedProgram(call).wait();
 }
 
 std::vector<ProgramRun> programsRun(const std::vector<ProgramCall> &calls) {
     std::vector<std::unique_ptr<StartedProgram>> started;
     started.reserve(calls.size());
     for (const ProgramCall &call : calls) {
-        started.push_back(std::make_unique<StartedProgram>(call.command, call.input));
+        started.push_back(std::make_unique<StartedProgram>(call));
     }
     std::vector<ProgramRun> runs;
     runs.reserve(calls.size());

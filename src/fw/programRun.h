@@ -18,10 +18,11 @@ struct ProgramRun {
 struct ProgramCall {
     std::vector<std::string> command;  ///< absolute path first
     std::string input;
+    const char *setting = nullptr;  ///< "NAME=value", added to this process's environment
 };
 
-/// Runs a program (absolute path first) without a shell and waits for it. It inherits no descriptors beyond 0 to 2.
-ProgramRun programRun(const std::vector<std::string> &command, const std::string &input);
+/// Runs a program without a shell and waits for it. It inherits no descriptors beyond 0 to 2.
+ProgramRun programRun(const ProgramCall &call);
 
 /// Runs all of them at the same time, each as programRun() does, and waits for all. @return the results in order
 std::vector<ProgramRun> programsRun(const std::vector<ProgramCall> &calls);

@@ -22,8 +22,9 @@ bool open(KmodLibrary &library) {
     void *const handle = dlopen(kLibraryName, RTLD_LAZY | RTLD_LOCAL);
     if (handle == nullptr)
         return false;
-#define VELD_KMOD_FIND(function) &&find(handle, #function, library.function)
-    const bool isWhole = true VELD_KMOD_FUNCTIONS(VELD_KMOD_FIND);
+    bool isWhole = true;
+#define VELD_KMOD_FIND(function) isWhole = find(handle, #function, library.function) && isWhole;
+    VELD_KMOD_FUNCTIONS(VELD_KMOD_FIND)
 #undef VELD_KMOD_FIND
     return isWhole;
 }

@@ -24,6 +24,7 @@ struct KmodLibrary {
     FUNCTION(kmod_module_get_refcnt)                                                                                   \
     FUNCTION(kmod_module_probe_insert_module)                                                                          \
     FUNCTION(kmod_module_remove_module)
+// NOLINTNEXTLINE(bugprone-macro-parentheses): a name cannot be declared in parentheses
 #define VELD_KMOD_MEMBER(function) decltype(&::function) function = nullptr;
     VELD_KMOD_FUNCTIONS(VELD_KMOD_MEMBER)
 #undef VELD_KMOD_MEMBER
