@@ -10,6 +10,7 @@
 #include "frame/verb.h"
 #include "model/ruleText.h"
 #include "system/apply.h"
+#include "system/editLock.h"
 #include "system/store.h"
 
 namespace veldfwctl {
@@ -98,9 +99,9 @@ int rename(const Context &context, const Options &options) {
                                          std::to_string(replaced) + " profiles by those of " + options.oldName + "?")) {
         return STATUS_NO;
     }
-    require("Cannot move the rules of adapter \"" + options.oldName + "\"",
-            "profiles before the failing one are changed",
-            [&] { return FW::VELDFW_PROFILE().profileChangeAdapter(options.oldName, options.newName, false); });
+    editRequire("Cannot move the rules of adapter \"" + options.oldName + "\"",
+                "profiles before the failing one are changed",
+                [&] { return FW::VELDFW_PROFILE().profileChangeAdapter(options.oldName, options.newName, false); });
     context.print("Moved rules and default policies of " + options.oldName + " to " + options.newName + " in " +
                   std::to_string(concerned) + " profiles.");
     const bool applied = changeApply(context, settingsRead().profile, options.apply);

@@ -14,6 +14,7 @@
 #include "model/backupDocument.h"
 #include "model/numbers.h"
 #include "system/apply.h"
+#include "system/editLock.h"
 #include "system/newFile.h"
 #include "system/store.h"
 
@@ -163,6 +164,10 @@ int importFrom(const Context &context, const Options &options) {
     } else {
         if (!context.confirm("Replace the configuration by that of " + options.file + "?")) {
             return STATUS_NO;
+        }
+        const EditLock lock;
+        if (configurationExport() != old) {
+            throw Failure("The configuration was changed meanwhile; nothing was imported: run this again");
         }
         configurationImport(document, old);
         context.print("Imported " + options.file + ".");

@@ -7,6 +7,7 @@
 #include "frame/verb.h"
 #include "model/ruleText.h"
 #include "system/apply.h"
+#include "system/editLock.h"
 #include "system/store.h"
 
 namespace veldfwctl {
@@ -30,9 +31,8 @@ int set(const Context &context, const Options &options) {
     if (adapterNames().count(options.adapter) == 0) {
         context.warn("there is no adapter \"" + options.adapter + "\" now; its policy has no effect until there is");
     }
-    FW::FWPROFILE profile = profileChosen(options.profile);
-    profile.adapterPolicyMap[options.adapter] = policy;
-    profileWrite(profile);
+    const FW::FWPROFILE profile =
+        profileEdit(options.profile, [&](FW::FWPROFILE &edited) { edited.adapterPolicyMap[options.adapter] = policy; });
     context.print("Default policy of " + options.adapter + " in profile \"" + profile.name + "\" is " +
                   policyText(policy) + ".");
     const bool applied = changeApply(context, profile.name, options.apply);

@@ -8,6 +8,7 @@
 #include "frame/verb.h"
 #include "model/ruleText.h"
 #include "system/apply.h"
+#include "system/editLock.h"
 #include "system/store.h"
 
 namespace veldfwctl {
@@ -89,6 +90,7 @@ int nameReport(const Context &context, const std::string &what, const std::strin
 }
 
 int create(const Context &context, const Options &options) {
+    const EditLock lock;
     nameMustBeFree(options.name);
     require("Cannot create profile \"" + options.name + "\"", "",
             [&] { return FW::VELDFW_PROFILE().profileCreate(options.name); });
@@ -96,6 +98,7 @@ int create(const Context &context, const Options &options) {
 }
 
 int copy(const Context &context, const Options &options) {
+    const EditLock lock;
     FW::FWPROFILE profile = profileRead(options.name);
     nameMustBeFree(options.newName);
     profile.name = options.newName;
@@ -104,6 +107,7 @@ int copy(const Context &context, const Options &options) {
 }
 
 int rename(const Context &context, const Options &options) {
+    const EditLock lock;
     profileRead(options.name);
     nameMustBeFree(options.newName);
     require("Cannot rename profile \"" + options.name + "\"", "",
@@ -121,7 +125,7 @@ int remove(const Context &context, const Options &options) {
                          " rules?")) {
         return STATUS_NO;
     }
-    require("Cannot delete profile \"" + options.name + "\"", "", [&] {
+    editRequire("Cannot delete profile \"" + options.name + "\"", "", [&] {
         FW::VELDFW_PROFILE profiles;
         return profiles.profileDelete(options.name) && !profiles.profileExist(options.name);
     });

@@ -10,6 +10,7 @@
 #include "model/ruleText.h"
 #include "system/apply.h"
 #include "system/countries.h"
+#include "system/editLock.h"
 #include "system/services.h"
 #include "system/store.h"
 
@@ -40,11 +41,10 @@ SystemKnowledge systemKnowledge() {
     return system;
 }
 
-/// Stores the changed profile, tells what was done with which rule, and applies it when asked to.
+/// Tells what was done with which rule, and applies the changed profile when asked to.
 /// @param done "Added"
 int changeFinish(const Context &context, const Options &options, const FW::FWPROFILE &profile, const std::string &done,
                  size_t number, const FW::FWRULE &rule) {
-    profileWrite(profile);
     context.print(done + " rule " + std::to_string(number) + " of " + options.adapter + " in profile \"" +
                   profile.name + "\": " + ruleText(rule));
     const bool applied = changeApply(context, profile.name, options.apply);
@@ -83,8 +83,10 @@ int list(const Context &context, const Options &options) {
 
 int add(const Context &context, const Options &options) {
     const FW::FWRULE rule = ruleFromRequest(options.request, systemKnowledge());
-    FW::FWPROFILE profile = profileChosen(options.profile);
-    const size_t number = ruleInsert(profile, options.adapter, options.position, rule);
+    size_t number = 0;
+    const FW::FWPROFILE profile = profileEdit(options.profile, [&](FW::FWPROFILE &edited) {
+        number = ruleInsert(edited, options.adapter, options.position, rule);
+    });
     if (adapterNames().count(options.adapter) == 0) {
         context.warn("there is no adapter \"" + options.adapter + "\" now; the rule has no effect until there is");
     }
@@ -94,26 +96,33 @@ int add(const Context &context, const Options &options) {
 int remove(const Context &context, const Options &options) {
     FW::FWPROFILE profile = profileChosen(options.profile);
     const FW::FWRULE rule = ruleAt(profile, options.adapter, options.number);
+    const std::string asked = ruleText(rule);
     if (!context.confirm("Remove rule " + std::to_string(options.number) + " of " + options.adapter +
-                         " from profile \"" + profile.name + "\": " + ruleText(rule) + "?")) {
+                         " from profile \"" + profile.name + "\": " + asked + "?")) {
         return STATUS_NO;
     }
-    ruleRemove(profile, options.adapter, options.number);
+    profile = profileEdit(profile.name, [&](FW::FWPROFILE &edited) {
+        if (ruleText(ruleAt(edited, options.adapter, options.number)) != asked) {
+            throw UsageError("The rules were changed meanwhile; look at them again with \"veldfwctl rule list\"");
+        }
+        ruleRemove(edited, options.adapter, options.number);
+    });
     return changeFinish(context, options, profile, "Removed", static_cast<size_t>(options.number), rule);
 }
 
 int move(const Context &context, const Options &options) {
-    FW::FWPROFILE profile = profileChosen(options.profile);
-    ruleMove(profile, options.adapter, options.number, options.newNumber);
+    FW::FWPROFILE profile = profileEdit(options.profile, [&options](FW::FWPROFILE &edited) {
+        ruleMove(edited, options.adapter, options.number, options.newNumber);
+    });
     const FW::FWRULE rule = ruleAt(profile, options.adapter, options.newNumber);
     return changeFinish(context, options, profile, "Moved", static_cast<size_t>(options.newNumber), rule);
 }
 
 int enable(const Context &context, const Options &options, bool enabled) {
-    FW::FWPROFILE profile = profileChosen(options.profile);
-    FW::FWRULE &rule = ruleAt(profile, options.adapter, options.number);
-    rule.enable = enabled;
-    const FW::FWRULE changed = rule;
+    FW::FWPROFILE profile = profileEdit(options.profile, [&](FW::FWPROFILE &edited) {
+        ruleAt(edited, options.adapter, options.number).enable = enabled;
+    });
+    const FW::FWRULE changed = ruleAt(profile, options.adapter, options.number);
     return changeFinish(context, options, profile, enabled ? "Enabled" : "Disabled",
                         static_cast<size_t>(options.number), changed);
 }

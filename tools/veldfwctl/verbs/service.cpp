@@ -10,6 +10,7 @@
 #include "model/ports.h"
 #include "model/ruleText.h"
 #include "system/apply.h"
+#include "system/editLock.h"
 #include "system/services.h"
 #include "system/store.h"
 
@@ -130,8 +131,9 @@ int reserve(const Context &context, const Options &options) {
         context.warn("there is no adapter \"" + options.adapter + "\" now; the rule has no effect until there is");
     }
     const FW::FW_POLICY policy = options.deny ? FW::FW_POLICY_DENY : FW::FW_POLICY_ALLOW;
-    require("Cannot reserve service \"" + options.name + "\"", "profiles before the failing one have the rule now",
-            [&] { return FW::VELDFW_PROFILE().profileAddServToReserve(options.adapter, options.name, policy, false); });
+    editRequire(
+        "Cannot reserve service \"" + options.name + "\"", "profiles before the failing one have the rule now",
+        [&] { return FW::VELDFW_PROFILE().profileAddServToReserve(options.adapter, options.name, policy, false); });
     return changeReport(context, options,
                         "Every profile begins with a rule of " + options.adapter + " to " + policyText(policy) +
                             " service " + options.name + ".");
@@ -149,8 +151,8 @@ int release(const Context &context, const Options &options) {
                                     " rules that are not reserved, and drop those that name no other?")) {
         return STATUS_NO;
     }
-    require("Cannot release service \"" + options.name + "\"", "profiles before the failing one are changed",
-            [&] { return FW::VELDFW_PROFILE().profileRemoveServ(options.name); });
+    editRequire("Cannot release service \"" + options.name + "\"", "profiles before the failing one are changed",
+                [&] { return FW::VELDFW_PROFILE().profileRemoveServ(options.name); });
     return changeReport(context, options,
                         "Took service " + options.name + " out of " + std::to_string(uses.size()) + " rules.");
 }
