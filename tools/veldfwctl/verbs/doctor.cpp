@@ -199,7 +199,8 @@ void countriesExamine(Findings &findings, bool areUsed) {
 }
 
 void locksExamine(Findings &findings) {
-    for (const LockHolder &holder : lockHoldersFind({"/tmp/", "/var/lock/firewall/", "/run/lock/firewall/", "/run/veld/"})) {
+    for (const LockHolder &holder :
+         lockHoldersFind({"/tmp/", "/var/lock/firewall/", "/run/lock/firewall/", "/run/veld/"})) {
         findings.push_back(
             {"locks", Verdict::NOTE,
              holder.path + " is held by process " + std::to_string(holder.process) + " (" + holder.program + ")",
