@@ -10,7 +10,7 @@ set -euo pipefail
 
 packages_of() {
   case $1 in
-    build) echo build-essential cmake ninja-build pkg-config libjsoncpp-dev libboost-dev libkmod-dev libmnl-dev libcli11-dev ;;
+    build) echo build-essential cmake ninja-build pkg-config libjsoncpp-dev libboost-dev libkmod-dev libmnl-dev libcli11-dev libtinyxml2-dev ;;
     demo) echo iptables iproute2 kmod netbase ;;
     test) packages_of demo && echo libgtest-dev libgmock-dev ;;
     lint) packages_of test && echo git clang-format clang-tidy shellcheck ;;
