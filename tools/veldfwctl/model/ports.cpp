@@ -112,4 +112,17 @@ std::string portsText(int32_t protocol, const std::vector<std::string> &ports) {
     return join(ports, ",") + "/" + protocolText(protocol);
 }
 
+std::string sidesText(const PortMatch &source, const PortMatch &destination) {
+    // Entries of a protocol without ports only say that the list counts.
+    const bool hasPorts = destination.protocol < FW::FW_PROTO_ICMP;
+    std::string text;
+    if (!destination.ports.empty() || !hasPorts) {
+        text = portsText(destination.protocol, hasPorts ? destination.ports : std::vector<std::string>());
+    }
+    if (!source.ports.empty()) {
+        text += (text.empty() ? "from " : ", from ") + portsText(source.protocol, source.ports);
+    }
+    return text.empty() ? "none" : text;
+}
+
 }  // namespace veldfwctl

@@ -30,6 +30,9 @@ std::string protocolText(int32_t protocol);
 /// "80,1000-2000/tcp".
 std::string portsText(int32_t protocol, const std::vector<std::string> &ports);
 
+/// Both lists of a service: "139,445/tcp, from 68/udp".
+std::string sidesText(const PortMatch &source, const PortMatch &destination);
+
 }  // namespace veldfwctl
 
 #endif
