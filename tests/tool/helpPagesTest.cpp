@@ -30,7 +30,8 @@ TEST(HelpPagesTest, CompletionFollowsTheVerbsAndTheirOptions) {
 
 TEST(HelpPagesTest, TheManualHasEveryVerbAndNoMistakeInItsForm) {
     const std::string page = runTool({"generate", "man"}).output;
-    for (const std::string verb : {"setup", "rule add", "try profile", "backup export", "country ranges"}) {
+    for (const std::string verb :
+         {"setup", "rule add", "try profile", "backup export", "country ranges", "service import"}) {
         EXPECT_THAT(page, HasSubstr("\n.SS \"veldfwctl " + verb));
     }
     EXPECT_THAT(page, Not(HasSubstr("generate")));

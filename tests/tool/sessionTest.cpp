@@ -8,13 +8,14 @@
 //   ~ PROFILE.ADAPTER {}   members that the last rule of that list has in the store; "none" for an empty list
 //   + command              an iptables command that was run, in this order among others
 //   % fail PART :: TEXT    from now on a command that holds PART fails, and prints TEXT
-//   % write PATH TEXT      writes a file
+//   % write PATH TEXT      writes a file; "\n" in the text stands for the end of a line
 //   % remove PATH
 #include <json/value.h>
 
 #include <algorithm>
 #include <filesystem>
 #include <fstream>
+#include <regex>
 #include <sstream>
 
 #include "commandRecorder.h"
@@ -190,7 +191,7 @@ private:
             m_failures.emplace_back(text.substr(5, split - 5), text.substr(split + 4));
             m_recorder.failMatching(m_failures.back().first, 2, m_failures.back().second);
         } else if (verb == "write") {
-            writeFile(object, rest);
+            writeFile(object, std::regex_replace(rest, std::regex(R"(\\n)"), "\n"));
         } else if (verb == "remove") {
             removeAll(object);
         } else {

@@ -1,8 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
-// Files that only their owner may read.
+// Files that are written as a whole.
 #include "system/newFile.h"
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -17,13 +18,13 @@ namespace veldfwctl {
 namespace {
 
 /// Makes a file from a template that ends in XXXXXX and fills it. @return its path, or empty with errno set
-std::string newFileWrite(std::string pattern, const std::string &text) {
+std::string newFileWrite(std::string pattern, const std::string &text, mode_t mode) {
     const int handle = mkostemp(pattern.data(), O_CLOEXEC);
     if (handle < 0) {
         return "";
     }
     size_t written = 0;
-    bool succeeded = true;
+    bool succeeded = fchmod(handle, mode) == 0;
     while (succeeded && written < text.size()) {
         const ssize_t count = write(handle, text.data() + written, text.size() - written);
         succeeded = count > 0 || (count < 0 && errno == EINTR);
@@ -45,22 +46,20 @@ std::string newFileWrite(std::string pattern, const std::string &text) {
 
 }  // namespace
 
-void fileReplace(const std::string &path, const std::string &text) {
-    const std::string temporary = newFileWrite(path + ".XXXXXX", text);
+void fileReplace(const std::string &path, const std::string &text, mode_t mode, const std::string &remedy) {
+    const std::string temporary = newFileWrite(path + ".XXXXXX", text, mode);
     if (temporary.empty() || std::rename(temporary.c_str(), path.c_str()) != 0) {
         const int error = errno;
         if (!temporary.empty()) {
             unlink(temporary.c_str());
         }
-        throw Failure("Cannot write " + path + ": " + std::strerror(error) +
-                      "; name a file in a directory that can be "
-                      "written");
+        throw Failure("Cannot write " + path + ": " + std::strerror(error) + "; " + remedy);
     }
 }
 
 std::string rescueFileWrite(const std::string &text) {
     for (const char *pattern : {"/var/tmp/veldfwctl-backup.XXXXXX", "/tmp/veldfwctl-backup.XXXXXX"}) {
-        if (std::string path = newFileWrite(pattern, text); !path.empty()) {
+        if (std::string path = newFileWrite(pattern, text, 0600); !path.empty()) {
             return path;
         }
     }

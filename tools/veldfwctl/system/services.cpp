@@ -7,10 +7,13 @@
 
 #include <filesystem>
 #include <fstream>
+#include <map>
 #include <set>
 
+#include "frame/errors.h"
 #include "frame/libraryCall.h"
 #include "model/ports.h"
+#include "system/newFile.h"
 
 namespace veldfwctl {
 
@@ -27,18 +30,27 @@ std::vector<std::string> strings(const VLIBCSZLIST *list) {
     return texts;
 }
 
-/// Names in the definition files; a file that cannot be read defines nothing, here as in the registry.
-void definedNamesAdd(std::set<std::string> &names) {
+/// The definition files by the name they define. The first file of a name counts, and one that cannot be read defines
+/// nothing, here as in the registry.
+std::map<std::string, std::string> definitionFiles() {
+    std::set<std::string> paths;
     std::error_code error;
     for (const auto &entry : std::filesystem::directory_iterator(DEFINITIONS, error)) {
-        std::ifstream file(entry.path());
-        Json::Value definition;
-        Json::CharReaderBuilder builder;
-        if (entry.path().extension() == ".json" && Json::parseFromStream(builder, file, &definition, nullptr) &&
-            definition.isObject() && definition["name"].isString()) {
-            names.insert(definition["name"].asString());
+        if (entry.path().extension() == ".json" && entry.path().filename().string().front() != '.') {
+            paths.insert(entry.path());
         }
     }
+    std::map<std::string, std::string> files;
+    for (const std::string &path : paths) {
+        std::ifstream file(path);
+        Json::Value definition;
+        Json::CharReaderBuilder builder;
+        if (Json::parseFromStream(builder, file, &definition, nullptr) && definition.isObject() &&
+            definition["name"].isString()) {
+            files.emplace(definition["name"].asString(), path);
+        }
+    }
+    return files;
 }
 
 void databaseNamesAdd(std::set<std::string> &names) {
@@ -80,7 +92,9 @@ bool ServiceRegistry::isUsable(const std::string &name) const {
 
 std::vector<Service> ServiceRegistry::all() const {
     std::set<std::string> names;
-    definedNamesAdd(names);
+    for (const auto &[name, file] : definitionFiles()) {
+        names.insert(name);
+    }
     databaseNamesAdd(names);
     std::vector<Service> services;
     for (const std::string &name : names) {
@@ -91,19 +105,32 @@ std::vector<Service> ServiceRegistry::all() const {
     return services;
 }
 
+void definitionsWrite(const std::vector<std::pair<ServiceDefinition, std::string>> &definitions) {
+    const std::map<std::string, std::string> files = definitionFiles();
+    for (const auto &[definition, origin] : definitions) {
+        const auto defining = files.find(definition.name);
+        const std::string path =
+            defining != files.end() ? defining->second : std::string(DEFINITIONS) + "/" + definition.name + ".json";
+        if (defining == files.end() && std::filesystem::exists(std::filesystem::symlink_status(path))) {
+            throw Failure(path + " is there and does not define service \"" + definition.name +
+                          "\"; mend, move or remove it");
+        }
+        fileReplace(path, definitionText(definition, origin), 0644,
+                    "run this as root, and \"veldfwctl setup\" before it");
+    }
+}
+
+ServiceDefinition definitionOf(const Service &service) {
+    if (!service.isUsable) {
+        return {service.name, service.sourceProtocol, {}, service.destinationProtocol, {}};
+    }
+    return {service.name, service.sourceProtocol, portSet(service.sourcePorts), service.destinationProtocol,
+            portSet(service.destinationPorts)};
+}
+
 std::string servicePortsText(const Service &service) {
-    std::string text;
-    const auto sideAppend = [&text](const std::string &head, int protocol, const std::vector<std::string> &ports) {
-        text += (text.empty() ? "" : ", ") + head + portsText(protocol, ports);
-    };
-    const bool hasPorts = service.destinationProtocol < FW::FW_PROTO_ICMP;
-    if (!service.destinationPorts.empty() || !hasPorts) {
-        sideAppend("", service.destinationProtocol, service.destinationPorts);
-    }
-    if (!service.sourcePorts.empty()) {
-        sideAppend("from ", service.sourceProtocol, service.sourcePorts);
-    }
-    return text.empty() ? "none" : text;
+    return sidesText({service.sourceProtocol, service.sourcePorts},
+                     {service.destinationProtocol, service.destinationPorts});
 }
 
 }  // namespace veldfwctl

@@ -8,7 +8,10 @@
 #include <memory>
 #include <optional>
 #include <string>
+#include <utility>
 #include <vector>
+
+#include "model/serviceImport.h"
 
 namespace veldfwctl {
 
@@ -37,6 +40,14 @@ private:
     };
     std::unique_ptr<VELDFWServiceList, Free> m_handle;
 };
+
+/// What rules that name the service match: nothing when it is switched off.
+ServiceDefinition definitionOf(const Service &service);
+
+/// Writes definitions, each in the place of what defined its name before, or else in a file of its own.
+/// @param definitions with the files that they come from
+/// @throws Failure at the first that cannot be written; those before it are there
+void definitionsWrite(const std::vector<std::pair<ServiceDefinition, std::string>> &definitions);
 
 /// "139,445/tcp, from 68/udp".
 std::string servicePortsText(const Service &service);

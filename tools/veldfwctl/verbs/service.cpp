@@ -13,6 +13,7 @@
 #include "system/editLock.h"
 #include "system/services.h"
 #include "system/store.h"
+#include "verbs/serviceImport.h"
 
 namespace veldfwctl {
 
@@ -160,7 +161,7 @@ int release(const Context &context, const Options &options) {
 }  // namespace
 
 void registerService(CLI::App &app, Context &context) {
-    CLI::App *group = verbGroupAdd(app, "service", "Services and their rules: list, show, reserve, release");
+    CLI::App *group = verbGroupAdd(app, "service", "Services and their rules: list, show, reserve, release, import");
     const auto options = std::make_shared<Options>();
     verbAdd(*group, context, {"list", "List the services that rules can name", "veldfwctl service list", [&context] {
                                   return list(context);
@@ -181,6 +182,7 @@ void registerService(CLI::App &app, Context &context) {
     named({"release", "Take a service out of all rules of every profile", "veldfwctl service release ssh --apply",
            [&context, options] { return release(context, *options); }, true})
         ->add_flag("--apply", options->apply, "Reload afterwards");
+    serviceImportAdd(*group, context);
 }
 
 }  // namespace veldfwctl
