@@ -52,6 +52,8 @@ unshare --net chroot "$tree" env -i PATH=/usr/sbin:/usr/bin:/sbin:/bin DEBIAN_FR
     veldfwctl setup
     veldfwctl enable
     veldfwctl status
+    printf "[Scanner]\nports=6566/tcp|6567\n" >/packages/scanner
+    veldfwctl service import --from /packages/scanner
     iptables -S INPUT_FIREWALL | grep -q -- "-j RETURN" || { echo "no rules are in force" >&2; exit 1; }
     dpkg -P $(for deb in "$@"; do dpkg-deb -f "$deb" Package; done) >/dev/null
     left=$(iptables -S; ip6tables -S)

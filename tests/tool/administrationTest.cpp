@@ -38,6 +38,12 @@ TEST_F(ToolTest, EveryCommandOfTheAdministratorsGuideWorks) {
     const std::string profile = readFile(std::string(VELD_DATA_DIR) + "/firewall.d/1.json");
     writeFile("/usr/veld/etc.defaults/firewall.d/1.json", profile);
     makeDirectories("/root");
+    // What another firewall manager would have installed, and nothing else of that kind.
+    for (const char *directory : {"/etc/firewalld", "/usr/lib/firewalld", "/etc/ufw"}) {
+        removeAll(directory);
+    }
+    writeFile("/usr/lib/firewalld/services/samba.xml", R"(<service><port port="137-138" protocol="udp"/>
+        <port port="139" protocol="tcp"/><port port="445" protocol="tcp"/><helper name="netbios-ns"/></service>)");
     const std::string path = std::filesystem::path(VELDFWCTL).parent_path().string() + ":" + std::getenv("PATH");
     ASSERT_EQ(0, setenv("PATH", path.c_str(), 1));
     const std::vector<std::string> commands =
