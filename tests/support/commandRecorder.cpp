@@ -2,6 +2,7 @@
 // Puts a recording program in the place of /sbin/iptables and /sbin/ip6tables.
 #include "commandRecorder.h"
 
+#include "caseTable.h"
 #include "files.h"
 #include "recordingProgram.h"
 #include "sandbox.h"
@@ -15,15 +16,6 @@ namespace veldtest {
 namespace {
 
 const std::string setAside = ".before-recording";
-
-/// The parts of a text of which each is followed by `end`.
-std::vector<std::string> cutAt(char end, const std::string &text) {
-    std::vector<std::string> parts;
-    std::istringstream in(text);
-    for (std::string part; std::getline(in, part, end);)
-        parts.push_back(part);
-    return parts;
-}
 
 }  // namespace
 
@@ -76,8 +68,8 @@ void CommandRecorder::setDelay(unsigned milliseconds) {
 
 std::vector<RecordedCommand> CommandRecorder::commands() const {
     std::vector<RecordedCommand> result;
-    for (const auto &run : cutAt(END_OF_RUN, readFile(RECORDER_RECORD))) {
-        const auto fields = cutAt('\0', run);
+    for (const auto &run : split(readFile(RECORDER_RECORD), END_OF_RUN)) {
+        const auto fields = split(run, '\0');
         RecordedCommand command{fields.at(1), {fields.begin() + 2, fields.end()}, {}};
         std::istringstream handles(fields[0]);
         for (int handle = -1; handles >> handle;)

@@ -20,7 +20,6 @@ namespace veldtest {
 namespace {
 
 using std::chrono::milliseconds;
-using std::chrono::steady_clock;
 
 using Address = std::unique_ptr<addrinfo, void (*)(addrinfo *)>;
 
@@ -33,37 +32,26 @@ Address parseAddress(const std::string &text, uint16_t port) {
     return {found, freeaddrinfo};
 }
 
-/// Waits until the socket has one of the events; false at the deadline.
-bool waitUntil(const Handle &socket, short events, steady_clock::time_point deadline) {
-    for (;;) {
-        const auto left = std::chrono::duration_cast<milliseconds>(deadline - steady_clock::now()).count();
-        if (left <= 0)
-            return false;
-        pollfd entry = {socket.get(), events, 0};
-        const int count = poll(&entry, 1, static_cast<int>(left));
-        if (count > 0)
-            return true;
-        if (count < 0 && errno != EINTR)
-            throw systemError("poll");
-    }
+/// Lets a call on the socket wait that long and no longer.
+void limitWaiting(const Handle &socket, milliseconds time) {
+    const timeval limit = {time.count() / 1000, time.count() % 1000 * 1000};
+    for (const int option : {SO_SNDTIMEO, SO_RCVTIMEO})
+        setsockopt(socket.get(), SOL_SOCKET, option, &limit, sizeof(limit));
 }
 
-ProbeResult resultOf(int error, const std::string &what) {
+ProbeResult resultOf(int error) {
     switch (error) {
     case 0:
         return ProbeResult::connected;
     case ECONNREFUSED:
     case ECONNRESET:
         return ProbeResult::refused;
+    case EINPROGRESS:  // of a connect() whose time is up
+    case EAGAIN:
     case ETIMEDOUT:
         return ProbeResult::timedOut;
-    case ENETUNREACH:
-    case EHOSTUNREACH:
-    case EPERM:
-    case EACCES:
-        return ProbeResult::unreachable;
     default:
-        throw systemError(what, error);
+        return ProbeResult::unreachable;
     }
 }
 
@@ -75,10 +63,11 @@ void runIn(const NetworkNamespace *space, const std::function<void()> &function)
         function();
 }
 
-/// Opens a socket that does not block and calls connect(). @param error of connect(), 0 when it succeeded
-Handle startConnect(int type, const ProbeTarget &target, int &error) {
+/// Opens a socket and calls connect(). @param error of connect(), 0 when it succeeded
+Handle startConnect(int type, const ProbeTarget &target, milliseconds timeout, int &error) {
     const auto address = parseAddress(target.address, target.port);
-    Handle socket(::socket(address->ai_family, type | SOCK_CLOEXEC | SOCK_NONBLOCK, 0), "socket");
+    Handle socket(::socket(address->ai_family, type | SOCK_CLOEXEC, 0), "socket");
+    limitWaiting(socket, timeout);
     if (!target.source.empty()) {
         const auto source = parseAddress(target.source, 0);
         if (bind(socket.get(), source->ai_addr, source->ai_addrlen) != 0)
@@ -86,37 +75,6 @@ Handle startConnect(int type, const ProbeTarget &target, int &error) {
     }
     error = connect(socket.get(), address->ai_addr, address->ai_addrlen) == 0 ? 0 : errno;
     return socket;
-}
-
-ProbeResult connectTcp(Handle &socket, const ProbeTarget &target, milliseconds timeout) {
-    const auto deadline = steady_clock::now() + timeout;
-    int error = 0;
-    socket = startConnect(SOCK_STREAM, target, error);
-    if (error == EINPROGRESS) {
-        if (!waitUntil(socket, POLLOUT, deadline))
-            return ProbeResult::timedOut;
-        socklen_t size = sizeof(error);
-        getsockopt(socket.get(), SOL_SOCKET, SO_ERROR, &error, &size);
-    }
-    return resultOf(error, "connect to " + target.address);
-}
-
-ProbeResult exchangeUdp(const ProbeTarget &target, milliseconds timeout) {
-    constexpr int attempts = 3;
-    int error = 0;
-    const Handle socket = startConnect(SOCK_DGRAM, target, error);
-    for (int attempt = 0; error == 0 && attempt < attempts; ++attempt) {
-        std::array<char, 64> buffer;
-        if (send(socket.get(), "probe", 5, MSG_NOSIGNAL) < 0)
-            error = errno;
-        else if (!waitUntil(socket, POLLIN, steady_clock::now() + timeout / attempts))
-            continue;
-        else if (recv(socket.get(), buffer.data(), buffer.size(), 0) >= 0)
-            return ProbeResult::connected;
-        else
-            error = errno;
-    }
-    return error == 0 ? ProbeResult::timedOut : resultOf(error, "exchange with " + target.address);
 }
 
 /// Takes both families.
@@ -172,61 +130,58 @@ bool echo(int socket) {
 }  // namespace
 
 const char *toText(ProbeResult result) {
-    switch (result) {
-    case ProbeResult::connected:
-        return "connected";
-    case ProbeResult::refused:
-        return "refused";
-    case ProbeResult::timedOut:
-        return "timed out";
-    case ProbeResult::unreachable:
-        return "unreachable";
-    }
-    return "unknown";
+    constexpr std::array texts = {"connected", "refused", "timed out", "unreachable"};
+    return texts.at(static_cast<size_t>(result));
 }
 
 ProbeResult probeTcp(const ProbeTarget &target, const NetworkNamespace *space, milliseconds timeout) {
     requireSandbox("connect to " + target.address);
-    Handle socket;
-    ProbeResult result = ProbeResult::timedOut;
-    runIn(space, [&] { result = connectTcp(socket, target, timeout); });
-    return result;
+    int error = 0;
+    runIn(space, [&] { startConnect(SOCK_STREAM, target, timeout, error); });
+    return resultOf(error);
 }
 
 ProbeResult probeUdp(const ProbeTarget &target, const NetworkNamespace *space) {
     requireSandbox("send to " + target.address);
-    ProbeResult result = ProbeResult::timedOut;
-    runIn(space, [&] { result = exchangeUdp(target, probeTimeout); });
-    return result;
+    int error = 0;
+    runIn(space, [&] {
+        constexpr int attempts = 3;
+        const Handle socket = startConnect(SOCK_DGRAM, target, probeTimeout / attempts, error);
+        char answer = 0;
+        for (int attempt = 0; error == 0 || (error == EAGAIN && attempt < attempts); ++attempt) {
+            const bool answered = send(socket.get(), "?", 1, 0) == 1 && recv(socket.get(), &answer, 1, 0) == 1;
+            error = answered ? 0 : errno;
+            if (answered)
+                break;
+        }
+    });
+    return resultOf(error);
 }
 
 Connection::Connection(const ProbeTarget &target, const NetworkNamespace *space) {
     requireSandbox("connect to " + target.address);
-    runIn(space, [&] {
-        const auto result = connectTcp(m_socket, target, std::chrono::seconds(5));
-        if (result != ProbeResult::connected)
-            throw std::runtime_error("connect to " + target.address + ": " + toText(result));
-    });
+    int error = 0;
+    runIn(space, [&] { m_socket = startConnect(SOCK_STREAM, target, std::chrono::seconds(5), error); });
+    if (error != 0)
+        throw systemError("connect to " + target.address, error);
 }
 
 ProbeResult Connection::exchange(milliseconds timeout) {
-    const auto deadline = steady_clock::now() + timeout;
+    const auto deadline = std::chrono::steady_clock::now() + timeout;
     const std::string line = "line " + std::to_string(++m_count) + "\n";
+    limitWaiting(m_socket, timeout);
     if (send(m_socket.get(), line.data(), line.size(), MSG_NOSIGNAL) < 0)
-        return resultOf(errno, "send");
+        return resultOf(errno);
     // Echoes of earlier lines, sent again by TCP after a blocked time, may come first.
     std::string received;
     while (received.find(line) == std::string::npos) {
-        if (!waitUntil(m_socket, POLLIN, deadline))
-            return ProbeResult::timedOut;
         std::array<char, 2048> buffer;
         const ssize_t count = recv(m_socket.get(), buffer.data(), buffer.size(), 0);
-        if (count == 0)
-            return ProbeResult::refused;
-        if (count < 0 && errno != EAGAIN)
-            return resultOf(errno, "receive");
-        if (count > 0)
-            received.append(buffer.data(), static_cast<size_t>(count));
+        if (count <= 0)
+            return resultOf(count == 0 ? ECONNRESET : errno);
+        received.append(buffer.data(), static_cast<size_t>(count));
+        if (std::chrono::steady_clock::now() > deadline)
+            return ProbeResult::timedOut;
     }
     return ProbeResult::connected;
 }

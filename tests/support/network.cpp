@@ -2,68 +2,33 @@
 // Network interfaces of the sandbox and further network namespaces.
 #include "network.h"
 
-#include "files.h"
-#include "handle.h"
 #include "processes.h"
 #include "sandbox.h"
 
 #include <fcntl.h>
 #include <sched.h>
-#include <sys/mount.h>
-#include <unistd.h>
 
-#include <exception>
-#include <thread>
+#include <future>
 
 namespace veldtest {
-namespace {
-
-const std::string namedSpaces = "/run/netns/";  // where ip(8) looks for names
-
-/// Runs a function on a thread of its own, because a namespace belongs to a thread, and passes its exception on.
-void onOwnThread(const std::function<void()> &function) {
-    std::exception_ptr failure;
-    std::thread worker([&] {
-        try {
-            function();
-        } catch (...) {
-            failure = std::current_exception();
-        }
-    });
-    worker.join();
-    if (failure)
-        std::rethrow_exception(failure);
-}
-
-}  // namespace
-
 NetworkNamespace::NetworkNamespace(std::string name) : m_name(std::move(name)) {
-    requireSandbox("make network namespace " + m_name);
-    onOwnThread([this] {
-        if (unshare(CLONE_NEWNET) != 0)
-            throw systemError("unshare the network");
-        m_handle = {open("/proc/thread-self/ns/net", O_RDONLY | O_CLOEXEC), "open /proc/thread-self/ns/net"};
-    });
-    const std::string file = namedSpaces + m_name;
-    writeFile(file, "");
-    const std::string source = "/proc/self/fd/" + std::to_string(m_handle.get());
-    if (mount(source.c_str(), file.c_str(), nullptr, MS_BIND, nullptr) != 0)
-        throw systemError("bind the network namespace to " + file);
+    ip({"netns", "add", m_name});
+    const std::string file = "/run/netns/" + m_name;
+    m_handle = {open(file.c_str(), O_RDONLY | O_CLOEXEC), "open " + file};
     setUp("lo", this);
 }
 
 NetworkNamespace::~NetworkNamespace() {
-    const std::string file = namedSpaces + m_name;
-    umount2(file.c_str(), MNT_DETACH);
-    unlink(file.c_str());
+    runProgram({"ip", "netns", "del", m_name});
 }
 
 void NetworkNamespace::run(const std::function<void()> &function) const {
-    onOwnThread([&] {
+    // On a thread of its own, because a namespace belongs to a thread.
+    std::async(std::launch::async, [&] {
         if (setns(m_handle.get(), CLONE_NEWNET) != 0)
             throw systemError("enter network namespace " + m_name);
         function();
-    });
+    }).get();
 }
 
 void ip(const std::vector<std::string> &arguments, const NetworkNamespace *space) {
@@ -79,10 +44,6 @@ void addDummyInterface(const std::string &name) {
     requireSandbox("add interface " + name);
     if (!runProgram({"ip", "link", "add", name, "type", "dummy"}).succeeded())
         ip({"link", "add", name, "type", "bridge"});
-}
-
-void addVethPair(const std::string &name, const std::string &peer) {
-    ip({"link", "add", name, "type", "veth", "peer", "name", peer});
 }
 
 void addVethPair(const std::string &name, const NetworkNamespace &other, const std::string &peer) {

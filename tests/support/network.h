@@ -38,9 +38,7 @@ void ip(const std::vector<std::string> &arguments, const NetworkNamespace *space
 /// Adds an interface that leads nowhere: of type dummy, or a bridge without ports where the kernel has no dummy. Down
 /// and without address.
 void addDummyInterface(const std::string &name);
-/// Adds a pair of connected interfaces, both in the sandbox's own namespace, down.
-void addVethPair(const std::string &name, const std::string &peer);
-/// Adds a pair, the peer in `other`.
+/// Adds a pair of connected interfaces, the peer in `other`, down.
 void addVethPair(const std::string &name, const NetworkNamespace &other, const std::string &peer);
 /// Removes an interface (of a pair: both).
 void removeInterface(const std::string &name);

@@ -2,70 +2,57 @@
 // The machine's own iptables, used on the sandbox's network.
 #include "realIptables.h"
 
-#include "files.h"
+#include "caseTable.h"
 #include "processes.h"
 #include "sandbox.h"
 
-#include <unistd.h>
-
-#include <exception>
-#include <sstream>
+#include <stdexcept>
 
 namespace veldtest {
 namespace {
 
-const std::vector<std::string> programs = {"/sbin/iptables", "/sbin/ip6tables"};
+ProgramResult runShell(const std::string &script) {
+    requireSandbox("use iptables");
+    return runProgram({"sh", "-ec", script});
+}
 
 }  // namespace
 
 bool realIptables(std::string *reason) {
-    requireSandbox("try iptables");
-    try {
-        for (const auto &program : programs) {
-            runChecked({program, "-N", "SANDBOX_PROBE"});
-            runChecked(
-                {program, "-A", "SANDBOX_PROBE", "-p", "tcp", "-m", "multiport", "--dports", "1,2", "-j", "DROP"});
-            runChecked({program, "-A", "SANDBOX_PROBE", "-m", "state", "--state", "ESTABLISHED", "-j", "ACCEPT"});
-            runChecked({program, "-F", "SANDBOX_PROBE"});
-            runChecked({program, "-X", "SANDBOX_PROBE"});
-        }
-        return true;
-    } catch (const std::exception &error) {
-        if (reason != nullptr)
-            *reason = error.what();
-        return false;
-    }
+    const auto tried = runShell(R"(
+        for program in /sbin/iptables /sbin/ip6tables; do
+            $program -N SANDBOX_PROBE
+            $program -A SANDBOX_PROBE -p tcp -m multiport --dports 1,2 -j DROP
+            $program -A SANDBOX_PROBE -m state --state ESTABLISHED -j ACCEPT
+            $program -F SANDBOX_PROBE
+            $program -X SANDBOX_PROBE
+        done)");
+    if (reason != nullptr)
+        *reason = tried.errors;
+    return tried.succeeded();
 }
 
 bool useIptablesBackend(const std::string &backend) {
-    requireSandbox("replace iptables");
-    for (const auto &program : programs) {
-        for (const std::string part : {"", "-restore", "-save"}) {
-            // "/sbin/iptables" + "-nft" + "-save"; looked up in both places, as merged and unmerged systems have it.
-            const std::string name = program + "-" + backend + part;
-            std::string found;
-            for (const std::string prefix : {"/usr", ""}) {
-                if (access((prefix + name).c_str(), X_OK) == 0)
-                    found = prefix + name;
-            }
-            if (found.empty())
-                return false;
-            unlink((program + part).c_str());
-            if (symlink(found.c_str(), (program + part).c_str()) != 0)
-                return false;
-        }
-    }
-    return true;
+    // "/sbin/iptables" + "-nft" + "-save"; looked up in both places, as merged and unmerged systems have it.
+    return runShell("for program in /sbin/iptables /sbin/ip6tables; do for part in '' -restore -save; do\n"
+                    "    name=$program-" +
+                    backend +
+                    "$part; [ ! -x /usr$name ] || name=/usr$name; [ -x $name ]\n"
+                    "    ln -sf $name $program$part\n"
+                    "done; done")
+        .succeeded();
 }
 
 void createFirewallChains() {
-    requireSandbox("create the firewall chains");
-    for (const auto &program : programs) {
-        for (const std::string hook : {"INPUT", "FORWARD"}) {
-            runChecked({program, "-N", hook + "_FIREWALL"});
-            runChecked({program, "-A", hook, "-j", hook + "_FIREWALL"});
-        }
-    }
+    const auto made = runShell(R"(
+        for program in /sbin/iptables /sbin/ip6tables; do
+            for hook in INPUT FORWARD; do
+                $program -N ${hook}_FIREWALL
+                $program -A $hook -j ${hook}_FIREWALL
+            done
+        done)");
+    if (!made.succeeded())
+        throw std::runtime_error("the firewall chains cannot be created: " + made.errors);
 }
 
 std::vector<std::string> listRules(const std::string &program, const std::string &chain) {
@@ -73,11 +60,7 @@ std::vector<std::string> listRules(const std::string &program, const std::string
     std::vector<std::string> command = {program, "-S"};
     if (!chain.empty())
         command.push_back(chain);
-    std::vector<std::string> rules;
-    std::istringstream lines(runChecked(command));
-    for (std::string line; std::getline(lines, line);)
-        rules.push_back(line);
-    return rules;
+    return split(runChecked(command), '\n');
 }
 
 }  // namespace veldtest
