@@ -8,35 +8,34 @@
 #include "veld/core.h"
 
 #include <fcntl.h>
-#include <gtest/gtest.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
 
-#include <chrono>
 #include <csignal>
-#include <cstring>
-#include <fstream>
 
 using namespace veldtest;
 
 namespace {
 
+int run(std::vector<const char *> words, int wait = 1) {
+    const char *program = words[0];
+    words.push_back(nullptr);
+    return VLIBCExecv(program, const_cast<char *const *>(words.data()), wait);
+}
+
 int runShell(const std::string &script, int wait = 1) {
-    const char *const arguments[] = {"sh", "-c", script.c_str(), nullptr};
-    return VLIBCExecv("/bin/sh", const_cast<char *const *>(arguments), wait);
+    return run({"/bin/sh", "-c", script.c_str()}, wait);
 }
 
-/// Runs a program at `path` that notes each run, and has the number of the run in $n.
-int runCounting(const std::string &path, const std::string &script, std::chrono::milliseconds busyTime) {
-    writeFile(path, "#!/bin/sh\necho run >> " + path + ".runs\nn=$(wc -l < " + path + ".runs)\n" + script + "\n", 0755);
+/// Runs a program at `path` that notes each run and has their number in $n. @return how often it ran, negative when it
+/// failed
+int runCounting(const std::string &path, const std::string &script, int busyMilliseconds) {
+    writeFile(path, "#!/bin/sh\necho >> " + path + ".runs\nn=$(wc -l < " + path + ".runs)\n" + script + "\n", 0755);
     const char *const arguments[] = {path.c_str(), nullptr};
-    return veld::runProgram(path.c_str(), const_cast<char *const *>(arguments), busyTime);
-}
-
-size_t runsOf(const std::string &path) {
-    return readFile(path + ".runs").size() / strlen("run\n");
+    const bool succeeded = veld::runProgram(path.c_str(), const_cast<char *const *>(arguments),
+                                            std::chrono::milliseconds(busyMilliseconds)) == 0;
+    return static_cast<int>(readFile(path + ".runs").size()) * (succeeded ? 1 : -1);
 }
 
 TEST(Exec, ResultIsZeroOnlyForExitStatusZeroAndTheLogSaysWhy) {
@@ -45,21 +44,25 @@ TEST(Exec, ResultIsZeroOnlyForExitStatusZeroAndTheLogSaysWhy) {
     EXPECT_TRUE(log.messages().empty()) << log.text();
     EXPECT_EQ(runShell("echo 'no such chain' >&2; printf 'bad\\001byte' >&2; exit 3"), -1);
     EXPECT_EQ(runShell("kill -9 $$"), -1);
-    const char *const missing[] = {"x", "-A", "INPUT", nullptr};
     for (const int wait : {0, 1})
-        EXPECT_EQ(VLIBCExecv("/no/such/program", const_cast<char *const *>(missing), wait), -1);
+        EXPECT_EQ(run({"/no/such/program", "-A", "INPUT"}, wait), -1);
     const std::string command = "/bin/sh -c echo 'no such chain' >&2; printf 'bad\\001byte' >&2; exit 3: ";
-    for (const std::string &reason :
-         {command + "no such chain", command + "bad?byte", command + "exited with status 3",
-          std::string("was killed by signal 9 (KILL)"),
-          std::string("/no/such/program -A INPUT: cannot be started: No such file or directory")})
-        EXPECT_TRUE(log.contains(reason)) << reason << "\n" << log.text();
+    const std::pair<std::string, size_t> messages[] = {
+        {command + "no such chain", 1},
+        {command + "bad?byte", 1},
+        {command + "exited with status 3", 1},
+        {"was killed by signal 9 (KILL)", 1},
+        {"/no/such/program -A INPUT: cannot be started: No such file or directory", 2}};
+    for (const auto &[message, count] : messages)
+        EXPECT_EQ(log.count(message), count) << message << "\n" << log.text();
     log.clear();
     EXPECT_EQ(runShell("echo deprecated >&2"), 0);
     ASSERT_EQ(log.count(": deprecated"), 1U) << log.text();
     EXPECT_EQ(log.messages().at(0).priority, LOG_WARNING) << "error output of a success";
-    EXPECT_EQ(VLIBCExecv(nullptr, const_cast<char *const *>(missing), 1), -1);
-    EXPECT_EQ(VLIBCExecv("/bin/true", nullptr, 1), -1);
+    char *const none[] = {nullptr};
+    EXPECT_EQ(VLIBCExecv(nullptr, none, 1), -1);
+    for (char *const *arguments : {none, static_cast<char *const *>(nullptr)})
+        EXPECT_EQ(VLIBCExecv("/bin/true", arguments, 1), -1);
 }
 
 TEST(Exec, TenMegabytesOfErrorOutputNeitherBlockNorFloodTheLog) {
@@ -81,69 +84,57 @@ TEST(Exec, ProgramInheritsNoDescriptorSignalMaskOrDisposition) {
     int lock = -1;
     ASSERT_EQ(VLIBCFileLockTimeByFile("/run/a.lock", 1, 0, &lock), 1);
     EXPECT_NE(fcntl(lock, F_GETFD) & FD_CLOEXEC, 0);
-    const char *const arguments[] = {"/sbin/iptables", "-L", nullptr};
-    EXPECT_EQ(VLIBCExecv("/sbin/iptables", const_cast<char *const *>(arguments), 1), 0);
+    EXPECT_EQ(run({"/sbin/iptables", "-L"}), 0);
     EXPECT_TRUE(recorder.commands().at(0).inheritedHandles.empty());
     close(plain);
-    VLIBCFileUnlockByFile(lock);
 
     sigset_t usr1;
     sigemptyset(&usr1);
     sigaddset(&usr1, SIGUSR1);
     sigprocmask(SIG_BLOCK, &usr1, nullptr);
     signal(SIGPIPE, SIG_IGN);
-    EXPECT_EQ(runShell("grep -E '^Sig(Blk|Ign)' /proc/self/status > /run/signals;"
-                       "streams=$(readlink /proc/$$/fd/0 /proc/$$/fd/1); echo \"$streams\" > /run/streams"),
+    EXPECT_EQ(runShell("(grep -E '^Sig(Blk|Ign)' /proc/self/status; readlink /proc/$$/fd/0 /proc/$$/fd/1) > /run/seen"),
               0);
     sigprocmask(SIG_UNBLOCK, &usr1, nullptr);
     signal(SIGPIPE, SIG_DFL);
     // 32 and 33 are the C library's own; posix_spawn() leaves them ignored.
-    EXPECT_EQ(readFile("/run/signals"), "SigBlk:\t0000000000000000\nSigIgn:\t0000000180000000\n");
-    EXPECT_EQ(readFile("/run/streams"), "/dev/null\n/dev/null\n");
+    EXPECT_EQ(readFile("/run/seen"), "SigBlk:\t0000000000000000\nSigIgn:\t0000000180000000\n/dev/null\n/dev/null\n");
 }
 
 TEST(Exec, CallerWithoutStandardStreamsOrExitStatusesLearnsWhatHappened) {
     SystemLog log;
-    EXPECT_EQ(runInChild([] {
-                  for (const int stream : {0, 1, 2})
-                      close(stream);
-                  return runShell("test -r /dev/fd/0 && echo out && echo reason >&2 && exit 7") == -1 ? 0 : 1;
-              }),
-              0);
-    EXPECT_TRUE(log.contains(": reason")) << log.text();
-    EXPECT_TRUE(log.contains("exited with status 7")) << log.text();
-    EXPECT_EQ(runInChild([] {
-                  signal(SIGCHLD, SIG_IGN);
-                  return runShell("exit 0") == -1 ? 0 : 1;
-              }),
-              0);
-    EXPECT_TRUE(log.contains("its exit status is lost: No child processes")) << log.text();
+    const auto withoutStreams = [] {
+        for (const int stream : {0, 1, 2})
+            close(stream);
+        return runShell("test -r /dev/fd/0 && echo out && echo reason >&2 && exit 7") == -1 ? 0 : 1;
+    };
+    const auto withoutStatuses = [] {
+        signal(SIGCHLD, SIG_IGN);
+        return runShell("exit 0") == -1 ? 0 : 1;
+    };
+    EXPECT_EQ(runInChild(withoutStreams), 0);
+    EXPECT_EQ(runInChild(withoutStatuses), 0);
+    for (const char *reason : {": reason", "exited with status 7", "its exit status is lost: No child processes"})
+        EXPECT_TRUE(log.contains(reason)) << log.text();
 }
 
 TEST(Exec, BusyTablesAreTriedAgainUntilTheyAreFree) {
     SystemLog log;
-    using namespace std::chrono_literals;
-    EXPECT_EQ(runCounting("/run/ip6tables-restore", "[ $n -ge 3 ] || { echo locked >&2; exit 4; }", 10s), 0);
-    EXPECT_EQ(runsOf("/run/ip6tables-restore"), 3U);
+    EXPECT_EQ(runCounting("/run/ip6tables-restore", "[ $n -ge 3 ] || { echo locked >&2; exit 4; }", 10'000), 3);
     EXPECT_FALSE(log.contains("locked"));
-    EXPECT_EQ(runCounting("/run/iptables", "echo locked >&2; exit 4", 60ms), -1);
-    EXPECT_GT(runsOf("/run/iptables"), 1U);
+    EXPECT_LT(runCounting("/run/iptables", "echo locked >&2; exit 4", 60), -1);
     EXPECT_TRUE(log.contains("/run/iptables: locked")) << log.text();
     EXPECT_TRUE(log.contains("/run/iptables: exited with status 4 at every try")) << log.text();
-    EXPECT_EQ(runCounting("/run/other", "exit 4", 10s), -1);
-    EXPECT_EQ(runsOf("/run/other"), 1U) << "status 4 means a lock for xtables programs only";
+    EXPECT_EQ(runCounting("/run/other", "exit 4", 10'000), -1) << "a lock for xtables programs only";
 }
 
 TEST(Exec, ProgramThatIsNotWaitedForLeavesNoChild) {
-    ASSERT_EQ(mkfifo("/run/go", 0600), 0);
     // It waits for our write: waiting for it would never end.
-    EXPECT_EQ(runShell("read line < /run/go; echo $line > /run/answer.tmp; mv /run/answer.tmp /run/answer", 0), 0);
+    runChecked({"mkfifo", "/run/go", "/run/answer"});
+    EXPECT_EQ(runShell("read line < /run/go; echo $line > /run/answer", 0), 0);
     EXPECT_EQ(waitpid(-1, nullptr, 0), -1);
     EXPECT_EQ(errno, ECHILD);
-    std::ofstream("/run/go") << "done\n";
-    while (!pathExists("/run/answer"))
-        usleep(1000);
-    EXPECT_EQ(readFile("/run/answer"), "done\n");
+    EXPECT_EQ(runChecked({"sh", "-c", "echo done > /run/go; cat /run/answer"}), "done\n");
 }
 
 TEST(Popen, ReadsFromAndWritesToAProgramAndTellsItsStatus) {
@@ -151,10 +142,9 @@ TEST(Popen, ReadsFromAndWritesToAProgramAndTellsItsStatus) {
     char *const end = nullptr;
     FILE *reader =
         VLIBCPopen("/bin/sh", "r", "-c", "printf '%s' \"$1\"; echo why >&2; exit 6", "sh", "$HOME ; text", end);
-    ASSERT_NE(reader, nullptr);
     // A second program must not hold the first one's pipe.
     FILE *writer = VLIBCPopen("/bin/sh", "w", "-c", "cat > /run/written", end);
-    ASSERT_NE(writer, nullptr);
+    ASSERT_TRUE(reader != nullptr && writer != nullptr);
     char line[64] = "";
     EXPECT_NE(fgets(line, sizeof line, reader), nullptr);
     EXPECT_STREQ(line, "$HOME ; text");

@@ -6,20 +6,15 @@
 #include "processes.h"
 #include "sandbox.h"
 
-#include <fcntl.h>
 #include <grp.h>
-#include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <functional>
-
 namespace veldtest {
-
-constexpr uid_t stranger = 65534;
 
 /// Does something as another user, in a child process.
 inline int asStranger(const std::function<bool()> &action) {
+    constexpr uid_t stranger = 65534;
     return runInChild([&] {
         if (setgroups(0, nullptr) != 0 || setgid(stranger) != 0 || setuid(stranger) != 0)
             return 99;
@@ -41,17 +36,15 @@ inline std::vector<Planted> plantedThings(const std::string &path, const std::st
             {"full directory", [=] { return makeDirectories(path + "/x"), true; }}};
 }
 
-/// Whether it is a file of this user.
-inline bool isOwnFile(const std::string &path) {
+/// Whether it is a file of this user with that mode.
+inline bool isOwnFile(const std::string &path, mode_t mode = 0644) {
     struct stat info {};
-    return lstat(path.c_str(), &info) == 0 && S_ISREG(info.st_mode) && info.st_uid == geteuid();
+    return lstat(path.c_str(), &info) == 0 && info.st_mode == (S_IFREG | mode) && info.st_uid == geteuid();
 }
 
 }  // namespace veldtest
 
 /// Needs real user ids, which a user namespace does not have.
 #define SKIP_WITHOUT_OTHER_USERS()                                                                                     \
-    do {                                                                                                               \
-        if (geteuid() != 0 || veldtest::sandboxInfo().userNamespace)                                                   \
-            GTEST_SKIP() << "not run by the real root, so that there is no other user to plant files";                 \
-    } while (false)
+    if (geteuid() != 0 || veldtest::sandboxInfo().userNamespace)                                                       \
+    GTEST_SKIP() << "not run by the real root, so that there is no other user to plant files"
