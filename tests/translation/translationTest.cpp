@@ -1,25 +1,21 @@
 // SPDX-License-Identifier: Apache-2.0
 // Every case in cases/ is a test; and what a case cannot show: what is remembered, steps called by themselves.
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <json/json.h>
 #include <syslog.h>
 
 #include <algorithm>
 #include <filesystem>
 #include <fstream>
-#include <functional>
 #include <optional>
-#include <sstream>
 #include <stdexcept>
 
+#include "caseTable.h"
 #include "files.h"
 #include "network.h"
 #include "systemLog.h"
+#include "veldfirewall/fwDB.h"
 #include "veldfirewall/fwIptables.h"
 
 using namespace veldtest;
-using testing::ElementsAre;
 
 namespace {
 
@@ -29,17 +25,9 @@ using Words = std::vector<std::string>;
 constexpr const char *TOOL = "/usr/veld/sbin/veldnetdtool";
 constexpr const char *TOOL_SCRIPT =
     "#!/bin/sh\n"
-    "echo \"$*\" >> /run/tool-runs\n"
+    "[ $# = 2 ] && [ \"$1\" = --get-ipv6-router-interface ] && echo \"$2\" >> /run/tool-runs\n"
     "[ -e \"/run/tool-answer.$2\" ] && exec printf %b \"$(cat \"/run/tool-answer.$2\")\"\n"
     "printf %s \"$2\"\n";
-
-Words split(const std::string &text, char separator) {
-    Words pieces;
-    std::istringstream stream(text);
-    for (std::string piece; std::getline(stream, piece, separator);)
-        pieces.push_back(piece);
-    return pieces;
-}
 
 std::pair<std::string, std::string> cut(const std::string &text, char separator) {
     const size_t at = text.find(separator);
@@ -47,83 +35,56 @@ std::pair<std::string, std::string> cut(const std::string &text, char separator)
                                    : std::pair(text.substr(0, at), text.substr(at + 1));
 }
 
+/// The rule of "ADAPTER field=value ...", by way of the document of a new rule.
 FW::FWRULE parseRule(const Words &words) {
-    FW::FWRULE rule;
-    const std::map<std::string, int32_t *> numbers = {{"adapterDirect", &rule.adapterDirect},
-                                                      {"ipType", &rule.ipType},
-                                                      {"ipDirect", &rule.ipDirect},
-                                                      {"ipGroup", &rule.ipGroup},
-                                                      {"portDirect", &rule.portDirect},
-                                                      {"portGroup", &rule.portGroup},
-                                                      {"protocol", &rule.protocol}};
-    const std::map<std::string, std::function<void(const std::string &)>> others = {
-        {"enable", [&](const std::string &value) { rule.enable = value != "0"; }},
-        {"blLog", [&](const std::string &value) { rule.blLog = value != "0"; }},
-        {"policy", [&](const std::string &value) { rule.policy = static_cast<FW::FW_POLICY>(std::stoi(value)); }},
-        {"name", [&](const std::string &value) { rule.name = value; }},
-        {"table", [&](const std::string &value) { rule.table = value; }},
-        {"ipList", [&](const std::string &value) { rule.ipList = split(value, ','); }},
-        {"portList", [&](const std::string &value) { rule.portList = split(value, ','); }},
-        {"chainList", [&](const std::string &value) {
-             const Words chains = split(value, ',');
-             rule.chainList = {chains.begin(), chains.end()};
-         }}};
-    for (size_t i = 1; i < words.size(); ++i) {  // the first names the adapter
-        const auto [key, value] = cut(words[i], '=');
-        if (const auto number = numbers.find(key); number != numbers.end())
-            *number->second = std::stoi(value);
-        else
-            others.at(key)(value);
-    }
-    return rule;
-}
-
-void installService(const Words &words) {
-    Json::Value json;
-    json["name"] = words.at(0);
-    json["enabled"] = true;
+    Json::Value document;
+    FW::VELDFW_JSON_DB().ruleListToJson({{"rules", {FW::FWRULE()}}}, document);
+    Json::Value &members = document["rules"][0];
+    std::optional<Words> chains;
     for (size_t i = 1; i < words.size(); ++i) {
-        if (words[i] == "disabled") {
-            json["enabled"] = false;
-            continue;
-        }
-        const auto [side, service] = cut(words[i], '=');
-        const auto [protocol, ports] = cut(service, ':');
-        json[side]["protocol"] = protocol;
-        json[side]["ports"] = Json::Value(Json::arrayValue);
-        for (const std::string &port : split(ports, ','))
-            json[side]["ports"].append(port);
+        const auto [key, value] = cut(words[i], '=');
+        if (key == "chainList")
+            chains = split(value, ',');
+        else if (!members.isMember(key))
+            throw std::out_of_range(key);
+        else if (members[key].isString())
+            members[key] = value;
+        else if (!members[key].isArray())
+            members[key] = std::stoi(value);
+        else
+            for (const std::string &item : split(value, ','))
+                members[key].append(item);
     }
-    writeFile("/usr/veld/etc/services.d/" + words[0] + ".json", json.toStyledString());
+    std::map<std::string, std::vector<FW::FWRULE>> rules;
+    FW::VELDFW_JSON_DB().jsonToRuleList(document, rules);
+    FW::FWRULE rule = rules["rules"][0];
+    if (chains)
+        rule.chainList = {chains->begin(), chains->end()};  // reading a document would add both chains of the firewall
+    return rule;
 }
 
 /// A case that is read: the sandbox looks as it says, and this is the call and what must come out.
 struct TranslationCase {
     /// Throws std::runtime_error that names file and line for what it does not know.
     void read(const std::string &name);
-    void applyLine(const std::string &key, const std::string &rest);
+    void applyLine(int line, const std::string &key, const std::string &rest);
 
     bool keepEstablished = false;
     std::optional<std::string> client;
     FW::FWPROFILE profile;
     bool fails = false;
     Words log;                                    ///< "error fwIptables.cpp text", all in order
-    std::optional<Words> toolRuns;                ///< arguments of each run of the network tool
+    std::optional<Words> toolRuns;                ///< the interface of each run of the network tool
     std::map<std::string, std::string> commands;  ///< "v4 eth0" to its indented lines
 };
 
-void TranslationCase::applyLine(const std::string &key, const std::string &rest) {
+void TranslationCase::applyLine(int line, const std::string &key, const std::string &rest) {
     const Words words = split(rest, ' ');
-    const auto askedFor = [&] {
-        toolRuns.emplace();
-        for (const std::string &interface : words)
-            toolRuns->push_back("--get-ipv6-router-interface " + interface);
-    };
     const std::map<std::string, std::function<void()>> lines = {
         {"interfaces", [&] { std::for_each(words.begin(), words.end(), addDummyInterface); }},
         {"pppoe", [&] { writeFile("/run/ppp-pppoe.pid", "4711\n" + rest + "\n"); }},
         {"wireless", [&] { writeFile("/etc.defaults/veldinfo.conf", "support_wireless=\"yes\"\n"); }},
-        {"service", [&] { installService(words); }},
+        {"service", [&] { writeFile("/usr/veld/etc/services.d/" + std::to_string(line) + ".json", rest); }},
         {"service-registry-empty", [&] { writeFile("/etc/services", ""); }},
         {"geoip", [&] { writeFile("/usr/share/xt_geoip/" + words.at(0), std::string(std::stoul(words.at(1)), '\1')); }},
         {"tunnel", [&] { writeFile("/run/tool-answer." + words.at(0), cut(rest, ' ').second); }},
@@ -135,7 +96,7 @@ void TranslationCase::applyLine(const std::string &key, const std::string &rest)
         {"fails", [&] { fails = true; }},
         {"preamble-spelled-out", [&] { commands.clear(); }},
         {"log", [&] { log.push_back(rest); }},
-        {"tool-asked", askedFor},
+        {"tool-asked", [&] { toolRuns = words; }},
         {"v4", [&] { commands["v4 " + rest]; }},
         {"v6", [&] { commands["v6 " + rest]; }}};
     lines.at(key)();
@@ -158,29 +119,23 @@ void TranslationCase::read(const std::string &name) {
             }
             group = line;
             const auto [key, rest] = cut(line, ' ');
-            applyLine(key, rest);
+            applyLine(number, key, rest);
         } catch (const std::logic_error &) {
             throw std::runtime_error(name + ":" + std::to_string(number) + ": not understood: " + line);
         }
     }
 }
 
-std::string toText(const std::map<std::string, std::string> &commands) {
-    std::string text;
-    for (const auto &[group, lines] : commands)
-        text += group + "\n" + lines;
-    return text;
-}
-
-std::string toText(const Json::Value &cmdList) {
-    std::map<std::string, std::string> commands;
+/// The commands as a case lists them: "v4 eth0" to its indented lines.
+std::map<std::string, std::string> groupsOf(const Json::Value &cmdList) {
+    std::map<std::string, std::string> groups;
     for (const std::string &family : cmdList.getMemberNames()) {
         for (const std::string &group : cmdList[family].getMemberNames()) {
             for (const Json::Value &command : cmdList[family][group])
-                commands[family + " " + group] += "    " + command.asString() + "\n";
+                groups[family + " " + group] += "    " + command.asString() + "\n";
         }
     }
-    return toText(commands);
+    return groups;
 }
 
 /// What the translation wrote, without line numbers.
@@ -219,7 +174,7 @@ TEST_P(Translation, GivesTheCommandsOfTheCase) {
             ? translator.fwRulesToIptablesRules(wanted.keepEstablished, rules, policies, cmdList, *wanted.client)
             : translator.fwRulesToIptablesRules(wanted.keepEstablished, rules, policies, cmdList);
     EXPECT_EQ(outcome, !wanted.fails);
-    EXPECT_EQ(toText(cmdList), toText(wanted.commands));
+    EXPECT_EQ(groupsOf(cmdList), wanted.commands);
     EXPECT_EQ(libraryMessages(log), wanted.log) << log.text();
     if (wanted.toolRuns) {
         EXPECT_EQ(split(pathExists("/run/tool-runs") ? readFile("/run/tool-runs") : "", '\n'), *wanted.toolRuns);
@@ -268,9 +223,9 @@ TEST_F(Translator, StepsByThemselvesNameAnAbsentVpnAndKeepTheBlankBeforeNoTarget
     ASSERT_TRUE(translator.FwRuleToIptablesArg("vpn", rule, args));
     Json::Value cmdList;
     translator.iptablesArgToCmd("vpn", rule, args, cmdList);
-    EXPECT_EQ(toText(cmdList), "v4 vpn\n"
-                               "    -t filter -A INPUT_FIREWALL -i vpn -j LOG\n"
-                               "    -t filter -A INPUT_FIREWALL -i vpn \n");
+    EXPECT_EQ(groupsOf(cmdList)["v4 vpn"], "    -t filter -A INPUT_FIREWALL -i vpn -j LOG\n"
+                                           "    -t filter -A INPUT_FIREWALL -i vpn \n");
+    EXPECT_EQ(groupsOf(cmdList).size(), 1u);
 }
 
 }  // namespace
