@@ -9,22 +9,13 @@
 set -euo pipefail
 way=${1:?way} source_tree=${2:?source tree}
 
-expect() {  # expect <status> <text in the output> <command...>
-  local wanted=$1 text=$2 status=0 output
-  shift 2
-  output=$("$@" 2>&1) || status=$?
-  if [[ $status -ne $wanted || $output != *"$text"* ]]; then
-    printf '%s: status %d, expected %d and "%s"\n%s\n' "$*" "$status" "$wanted" "$text" "$output" >&2
-    exit 1
-  fi
-}
-
 try_examples() {  # try_examples <folder of blocked, profiles and readme>
-  expect 0 "usage: blocked" "$1/blocked" --help
-  expect 2 "usage: blocked" "$1/blocked"
-  expect 0 "usage: profiles" "$1/profiles" --help
-  expect 2 "usage: profiles" "$1/profiles" no-such-verb
-  expect 0 "libveldcore.so.1 => $PWD/installed" ldd "$1/readme"
+  "$1/blocked" --help | grep "usage: blocked"
+  "$1/profiles" --help | grep "usage: profiles"
+  ldd "$1/readme" | grep -F "libveldcore.so.1 => $PWD/installed"
+  local status=0
+  "$1/profiles" no-such-verb || status=$?
+  [[ $status -eq 2 ]]
 }
 
 with_find_package() {
