@@ -8,16 +8,13 @@
 #include <boost/interprocess/sync/file_lock.hpp>
 #include <regex>
 #include <sstream>
-#include <stdexcept>
 
+#include "caseTable.h"
 #include "files.h"
 
 namespace veldtest {
-namespace {
 
-constexpr const char *HOOK_RUNS = "/run/hook-runs";
-
-}  // namespace
+static constexpr const char *HOOK_RUNS = "/run/hook-runs";
 
 FirewallTest::FirewallTest() {
     writeFile(PROFILE, R"({"name": "default"})");
@@ -27,22 +24,9 @@ FirewallTest::FirewallTest() {
     writeFile("/usr/veld/sbin/veldnetdtool", "#!/bin/sh\nprintf %s \"$2\"\n", 0755);
 }
 
-void FirewallTest::storeProfile(const std::map<std::string, std::vector<FW::FWRULE>> &rules,
-                                const std::map<std::string, FW::FW_POLICY> &policies) {
-    FW::FWPROFILE profile;
-    profile.name = "default";
-    profile.rules = rules;
-    profile.adapterPolicyMap = policies;
-    if (!FW::VELDFW_PROFILE().profileSet("default", profile))
-        throw std::runtime_error("no profile could be stored: " + log.text());
-    log.clear();
-}
-
 bool FirewallTest::isSwitchedOn() {
     Json::Value settings;
     std::istringstream(readFile(SETTINGS)) >> settings;
-    if (!settings["status"].isBool())
-        throw std::runtime_error("no \"status\" in the settings");
     return settings["status"].asBool();
 }
 
@@ -56,12 +40,9 @@ void FirewallTest::installNotingHooks() {
 }
 
 std::vector<std::string> FirewallTest::takeHookRuns() {
-    std::vector<std::string> runs;
-    std::istringstream lines(pathExists(HOOK_RUNS) ? readFile(HOOK_RUNS) : "");
-    for (std::string line; std::getline(lines, line);)
-        runs.push_back(line);
+    const std::string runs = pathExists(HOOK_RUNS) ? readFile(HOOK_RUNS) : "";
     removeAll(HOOK_RUNS);
-    return runs;
+    return split(runs, '\n');
 }
 
 bool FirewallTest::execLockIsFree() {

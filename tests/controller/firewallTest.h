@@ -4,7 +4,6 @@
 #define VELD_TEST_FIREWALL_TEST_H
 
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 
 #include <string>
 #include <vector>
@@ -26,10 +25,7 @@ class FirewallTest : public testing::Test {
 protected:
     FirewallTest();
 
-    /// Stores rules and default policies by adapter in the profile "default".
-    void storeProfile(const std::map<std::string, std::vector<FW::FWRULE>> &rules,
-                      const std::map<std::string, FW::FW_POLICY> &policies = {});
-    /// The settings' "status", read from the file; throws when it is no boolean.
+    /// The settings' "status", read from the file.
     static bool isSwitchedOn();
     /// Installs an executable hook of "enable" or "disable".
     static void installHook(const std::string &action, const std::string &name, const std::string &script);

@@ -1,10 +1,15 @@
 // SPDX-License-Identifier: Apache-2.0
-// Switching on, applying and switching off: the exact commands, and every way to fail on the way.
-#include <json/json.h>
+// Switching on, applying and switching off: the exact commands, the hooks, the lock, and every way to fail on the way.
+#include <unistd.h>
+#include <veld/core.h>
+
+#include <csignal>
+#include <sstream>
 
 #include "commandRecorder.h"
 #include "files.h"
 #include "firewallTest.h"
+#include "processes.h"
 
 using namespace veldtest;
 using testing::Contains;
@@ -31,13 +36,12 @@ Lines operator+(Lines first, const Lines &second) {
 class Lifecycle : public FirewallTest {
 protected:
     Lifecycle() {
-        storeProfile({{"global", {portRule("23", FW::FW_POLICY_DENY)}}});
+        FW::VELDFW_PROFILE().profileSet("default", {"default", {{"global", {portRule("23", FW::FW_POLICY_DENY)}}}, {}});
         installNotingHooks();
     }
 
-    /// On, with "default" active, and nothing noted yet.
-    void switchOn() {
-        ASSERT_TRUE(firewall.fwEnable()) << log.text();
+    /// Forgets what was noted up to now.
+    void startAnew() {
         recorder.clear();
         log.clear();
         takeHookRuns();
@@ -48,10 +52,10 @@ protected:
         Json::Value commands;
         EXPECT_TRUE(firewall.fwIptablesRulesEnum("default", commands, keepEstablished));
         Lines lines = SET_DROP + FLUSH;
-        for (const Json::Value &command : commands["v4"]["global"])
-            lines.push_back("/sbin/iptables " + command.asString());
-        for (const Json::Value &command : commands["v6"]["global"])
-            lines.push_back("/sbin/ip6tables " + command.asString());
+        for (const auto &[family, program] : {std::pair("v4", "/sbin/iptables "), {"v6", "/sbin/ip6tables "}}) {
+            for (const Json::Value &command : commands[family]["global"])
+                lines.push_back(program + command.asString());
+        }
         EXPECT_EQ(lines.size(), keepEstablished ? 28u : 24u);
         return lines + SET_ACCEPT;
     }
@@ -97,9 +101,7 @@ TEST_F(Lifecycle, EveryCommandThatFailsLeavesADefinedState) {
     for (size_t n = 1; n <= whole.size(); ++n) {
         SCOPED_TRACE("command " + std::to_string(n) + " fails: " + whole[n - 1]);
         ASSERT_TRUE(firewall.fwDisable());
-        recorder.clear();
-        log.clear();
-        takeHookRuns();
+        startAnew();
         recorder.failAt(static_cast<unsigned>(n), 2, "refused");
         const bool outcome = firewall.fwEnable();
         const Lines reached(whole.begin(), whole.begin() + static_cast<std::ptrdiff_t>(n));
@@ -130,7 +132,8 @@ TEST_F(Lifecycle, EveryCommandThatFailsLeavesADefinedState) {
 }
 
 TEST_F(Lifecycle, ProfileThatCannotBeAppliedRestoresAcceptAndTheFirewallStaysOn) {
-    switchOn();
+    ASSERT_TRUE(firewall.fwEnable()) << log.text();
+    takeHookRuns();
     struct Row {
         const char *active;
         const char *rulePolicy;
@@ -164,7 +167,8 @@ TEST_F(Lifecycle, ProfileThatCannotBeAppliedRestoresAcceptAndTheFirewallStaysOn)
 }
 
 TEST_F(Lifecycle, SettingsThatCannotBeReadStopEverySwitch) {
-    switchOn();
+    ASSERT_TRUE(firewall.fwEnable()) << log.text();
+    startAnew();
     writeFile(SETTINGS, "{ broken");
     EXPECT_FALSE(firewall.fwReload(true));
     EXPECT_FALSE(firewall.fwEnable());
@@ -175,6 +179,55 @@ TEST_F(Lifecycle, SettingsThatCannotBeReadStopEverySwitch) {
     EXPECT_THAT(recorder.lines(), ElementsAreArray(FLUSH));
     EXPECT_THAT(takeHookRuns(), ElementsAre("enable pre 0", "enable post -1", "disable pre 0", "disable post -1"));
     EXPECT_TRUE(execLockIsFree());
+}
+
+TEST_F(Lifecycle, FailureOfAHookIsToldAndNeverDecidesTheSwitch) {
+    for (const char *action : {"enable", "disable"})
+        installHook(action, "10-fails", "echo no mail server >&2; exit 3");
+    EXPECT_TRUE(firewall.fwEnable());
+    EXPECT_TRUE(firewall.fwDisable());
+    EXPECT_FALSE(isSwitchedOn());
+    EXPECT_THAT(takeHookRuns(), ElementsAre("enable pre 0", "enable post 0", "disable pre 0", "disable post 0"));
+    std::vector<std::string> expected;
+    for (const std::string action : {"enable", "disable"}) {
+        for (const std::string moment : {"pre", "post"}) {
+            expected.push_back("fwHook.cpp Failed to run hook: net/firewall_" + action);
+            expected.push_back("veldFW.cpp Failed to run firewall " + action + " " + moment + "-hook.");
+        }
+    }
+    EXPECT_EQ(errors(), expected);
+    EXPECT_EQ(log.count("no mail server"), 4u) << log.text();
+}
+
+TEST_F(Lifecycle, ReloadsWaitForEachOther) {
+    ASSERT_TRUE(firewall.fwEnable());
+    startAnew();
+    int lock = -1;
+    ASSERT_EQ(VLIBCFileLockTimeByFile(EXEC_LOCK, 1, 0, &lock), 1);
+    std::vector<pid_t> processes;
+    for (int i = 0; i < 4; ++i)
+        processes.push_back(startChild([this] { return firewall.fwReload(true) ? 0 : 1; }));
+    sleep(1);
+    EXPECT_THAT(recorder.lines(), IsEmpty()) << "commands ran while the lock was held";
+    VLIBCFileUnlockByFile(lock);
+    for (const pid_t process : processes)
+        EXPECT_EQ(waitForChild(process), 0) << log.text();
+    const Lines once = applying(true);
+    EXPECT_EQ(recorder.lines(), once + once + once + once);
+}
+
+TEST_F(Lifecycle, LockIsFreeWhileADaemonThatAHookLeftBehindStillRuns) {
+    // The hook of disabling runs below a reload that holds the lock, because a command is refused.
+    for (const char *action : {"enable", "disable"})
+        installHook(action, "50-daemon", "sleep 600 &\necho $! >> /run/hook-daemons");
+    recorder.failMatching("-i lo", 2, "refused");
+    EXPECT_FALSE(firewall.fwEnable());
+    EXPECT_TRUE(execLockIsFree());
+    std::istringstream daemons(readFile("/run/hook-daemons"));
+    int alive = 0;
+    for (pid_t daemon = 0; daemons >> daemon;)
+        alive += kill(daemon, SIGKILL) == 0 ? 1 : 0;
+    EXPECT_EQ(alive, 4) << "daemons that were there to the end";
 }
 
 }  // namespace

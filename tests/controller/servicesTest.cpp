@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // What the controller learns from the system: services for stored profiles, adapters for callers.
+#include "caseTable.h"
 #include "files.h"
 #include "firewallTest.h"
 #include "network.h"
@@ -10,55 +11,35 @@ using testing::UnorderedElementsAre;
 
 namespace {
 
-void defineService(const std::string &name, const std::string &protocol, bool enabled) {
-    writeFile("/usr/veld/etc/services.d/" + name + ".json",
-              R"({"name": ")" + name + R"(", "enabled": )" + (enabled ? "true" : "false") +
-                  R"(, "destination": {"protocol": ")" + protocol + R"(", "ports": ["7"]}})");
-}
-
 TEST_F(FirewallTest, UpdateBringsServiceRulesInLineWithTheServices) {
-    for (const char *protocol : {"tcp", "udp", "tcp+udp", "icmp"})
-        defineService(protocol, protocol, true);
-    defineService("off", "tcp", false);
-    constexpr int services = FW::FW_PORT_GROUP_SERVICE;
-    struct Row {
-        int portGroup;
-        std::vector<std::string> before;
-        std::vector<std::string> after;  ///< empty: the rule is gone
-        int protocol;                    ///< afterwards; 32 before
-    };
-    const Row rows[] = {
-        {services, {"tcp"}, {"tcp"}, 1},
-        {services, {"udp"}, {"udp"}, 2},
-        {services, {"udp", "tcp"}, {"udp", "tcp"}, 3},
-        {services, {"tcp+udp"}, {"tcp+udp"}, 32},  // counts for neither
-        {services, {"tcp+udp", "udp"}, {"tcp+udp", "udp"}, 2},
-        {services + 2, {"icmp"}, {"icmp"}, 32},
-        {services, {"gone", "tcp", "off", "discard"}, {"tcp", "discard"}, 1},
-        {services + 2, {"gone", "off"}, {}, 0},
-        {FW::FW_PORT_GROUP_PORT, {"gone"}, {"gone"}, 32},
-    };
-    std::vector<FW::FWRULE> rules;
-    for (const Row &row : rows) {
+    for (const std::string name : {"tcp", "udp", "tcp+udp", "icmp", "off"})
+        writeFile("/usr/veld/etc/services.d/" + name + ".json",
+                  R"({"name": ")" + name + R"(", "enabled": )" + (name == "off" ? "false" : "true") +
+                      R"(, "destination": {"ports": ["7"], "protocol": ")" + (name == "off" ? "tcp" : name) + "\"}}");
+    FW::FWPROFILE profile;
+    std::vector<FW::FWRULE> &rules = profile.rules["global"];
+    std::vector<std::string> expected;
+    for (const auto &row : readCases(VELD_CASE_DIRECTORY "serviceRules.cases", 4)) {
         rules.push_back(portRule("", FW::FW_POLICY_DENY));
-        rules.back().portGroup = row.portGroup;
-        rules.back().portList = row.before;
+        rules.back().portGroup = std::stoi(row[0]);
+        rules.back().portList = split(row[1], ' ');
         rules.back().protocol = FW::FW_PROTO_IGMP;
+        if (row[2] != "-")
+            expected.push_back(row[2] + " " + row[3]);
     }
-    storeProfile({{"global", rules}});
+    FW::VELDFW_PROFILE profiles;
+    ASSERT_TRUE(profiles.profileSet("default", {"default", profile.rules, {}}));
     EXPECT_TRUE(firewall.fwUpdate()) << log.text();
     FW::FWPROFILE stored;
-    ASSERT_TRUE(FW::VELDFW_PROFILE().profileGet("default", stored));
-    auto rule = stored.rules["global"].begin();
-    for (const Row &row : rows) {
-        if (row.after.empty())
-            continue;
-        ASSERT_NE(rule, stored.rules["global"].end());
-        EXPECT_EQ(rule->portList, row.after);
-        EXPECT_EQ(rule->protocol, row.protocol) << row.after[0];
-        ++rule;
+    ASSERT_TRUE(profiles.profileGet("default", stored));
+    std::vector<std::string> updated;
+    for (const FW::FWRULE &rule : stored.rules["global"]) {
+        std::string text;
+        for (const std::string &service : rule.portList)
+            text += service + " ";
+        updated.push_back(text + std::to_string(rule.protocol));
     }
-    EXPECT_EQ(rule, stored.rules["global"].end());
+    EXPECT_EQ(updated, expected);
     EXPECT_THAT(errors(), ElementsAre());
     removeAll("/usr/veld/etc/services.d");
     writeFile("/etc/services", "");
@@ -73,7 +54,7 @@ TEST_F(FirewallTest, AdaptersAreAtMost32InterfacesOnceAndTheThreeVirtualOnes) {
     std::set<std::string> adapters;
     EXPECT_TRUE(firewall.fwAdapterEnum(adapters));
     EXPECT_THAT(adapters, UnorderedElementsAre("eth0", "global", "pppoe", "vpn", "wlan0"));
-    removeAll("/etc.defaults/veldinfo.conf");
+    writeFile("/etc.defaults/veldinfo.conf", "support_wireless=\"no\"\n");
     for (int i = 1; i <= 31; ++i)
         addDummyInterface("lan" + std::to_string(i));
     adapters.clear();
