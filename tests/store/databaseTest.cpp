@@ -1,13 +1,16 @@
 // SPDX-License-Identifier: Apache-2.0
-// The profile database: names, file names, edits, messages, and how often it reads the files.
+// The profile database: names, file names, edits, messages, how often it reads the files, and broken and hostile ones,
+// which hide nothing but themselves.
 #include "openCounter.h"
 #include "storeFixture.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include <ctime>
 
 using namespace veldtest;
 using testing::ElementsAre;
-using testing::IsEmpty;
 
 namespace {
 
@@ -32,7 +35,7 @@ TEST_F(Database, FailuresAreNamedInTheLogAndChangeNothing) {
     makeDirectories(profileDirectory + "1.json.tmp");  // in the way of the write
     EXPECT_FALSE(db.profileSet("a", {}));
     EXPECT_FALSE(db.profileRename("a", "c"));
-    EXPECT_EQ(takeLastError(), "fwDB.cpp Failed to jsonFileDump [" + profileDirectory + "1.json]");
+    EXPECT_EQ(takeErrors().back(), "fwDB.cpp Failed to jsonFileDump [" + profileDirectory + "1.json]");
     EXPECT_EQ(storedText("1.json"), namedDocument("a"));
     EXPECT_EQ(storedText("2.json"), namedDocument("b"));
 }
@@ -79,7 +82,7 @@ TEST_F(Database, RenamingKeepsTheFileAndFollowsInTheSettings) {
     EXPECT_EQ(storedJson("1.json")["rules"]["eth0"][0]["name"], "r");
     EXPECT_TRUE(storedJson("1.json")["adapterPolicyMap"].isNull()) << "renaming completes no policies";
     EXPECT_EQ(storedJson("2.json")["name"], "c");
-    EXPECT_THAT(takeErrors(), IsEmpty());
+    EXPECT_THAT(takeErrors(), ElementsAre());
 }
 
 TEST_F(Database, StoringCompletesThePolicies) {
@@ -127,11 +130,94 @@ TEST_F(Database, EachOperationReadsEachProfileOnce) {
         counter.take();
         EXPECT_TRUE(operation());
         auto counts = counter.take();
-        for (const std::string &file : files) {
-            if (file != "firewall_settings.json") {
-                EXPECT_EQ(counts[file], 1) << file;
-            }
-        }
+        for (const std::string &file : files)
+            EXPECT_EQ(counts[file], file == "firewall_settings.json" ? counts[file] : 1) << file;
+    }
+}
+
+class HostileFiles : public Store {
+protected:
+    void expectOnlyItselfHidden(const std::string &what, bool reported) {
+        SCOPED_TRACE(what);
+        store("1.json", namedDocument("first"));
+        store("7.json", namedDocument("last"));
+        storeSettings("first");
+        FW::VELDFW_PROFILE manager;
+        takeErrors();
+        EXPECT_THAT(names(), ElementsAre("first", "last"));
+        EXPECT_EQ(log.count("Failed to load json from " + profileDirectory), reported ? 1u : 0u);
+        FW::FWPROFILE profile;
+        EXPECT_TRUE(manager.profileGet("last", profile));
+        std::map<std::string, FW::FWPROFILE> profiles;
+        EXPECT_TRUE(manager.profileEnum(profiles));
+        EXPECT_EQ(profiles.size(), 2u);
+        EXPECT_TRUE(manager.profileSet("last", profile));
+        EXPECT_TRUE(manager.profileRename("last", "renamed"));
+        Json::Value exported;
+        EXPECT_TRUE(db.exportConfig(exported));
+        EXPECT_EQ(exported["config_profiles"].size(), 2u);
+        EXPECT_TRUE(manager.profileDelete("renamed"));
+        EXPECT_THAT(names(), ElementsAre("first"));
+        removeAll(hostile);
+    }
+
+    const std::string hostile = profileDirectory + "5.json";
+};
+
+std::string nested(const std::string &opening, size_t depth) {
+    std::string result;
+    for (size_t i = 0; i < depth; ++i)
+        result += opening;
+    return result;
+}
+
+TEST_F(HostileFiles, HideNothingButThemselves) {
+    const std::string rules = "{\"name\": \"x\", \"rules\": ";
+    const std::string broken[] = {"",
+                                  rules + "{",
+                                  "\x7f ELF",
+                                  std::string(5000, '\0'),
+                                  nested("[", 100'000),
+                                  nested("{\"a\":", 100'000),
+                                  rules + nested("[", 2000) + nested("]", 2000) + "}",
+                                  std::string(100'000'000, ' ')};
+    for (const std::string &text : broken) {
+        writeFile(hostile, text);
+        expectOnlyItselfHidden(text.substr(0, 30), true);
+    }
+    for (const char *foreign : {"[{\"name\": \"x\"}]", "\"name\"", "5", "null", "{\"rules\": {}}", "{\"name\": {}}"}) {
+        writeFile(hostile, foreign);
+        expectOnlyItselfHidden(foreign, false);
+    }
+    makeDirectories(hostile);
+    expectOnlyItselfHidden("directory", true);
+    ASSERT_EQ(mkfifo(hostile.c_str(), 0666), 0);
+    expectOnlyItselfHidden("FIFO", true);
+    for (const char *target : {"nowhere", "5.json", "/dev/zero"}) {
+        ASSERT_EQ(symlink(target, hostile.c_str()), 0);
+        expectOnlyItselfHidden(target, true);
+    }
+    store(std::string(250, 'x') + ".json", namedDocument("x"));
+    expectOnlyItselfHidden("name that is too long for a lock file", true);
+}
+
+TEST_F(HostileFiles, WithValuesThatCannotBeConvertedFailWhatNeedsThemOnly) {
+    store("7.json", namedDocument("good"));
+    storeSettings("good");
+    for (const std::string &rules :
+         {std::string(R"({"eth0": [{"policy": {}}]})"), nested("[", 500) + nested("]", 500)}) {
+        store("5.json", R"({"name": "bad", "rules": )" + rules + "}");
+        EXPECT_THAT(names(), ElementsAre("bad", "good"));
+        FW::FWPROFILE profile;
+        std::map<std::string, FW::FWPROFILE> profiles;
+        EXPECT_THROW(db.profileGet("bad", profile), Json::LogicError);
+        EXPECT_THROW(db.profileEnum(profiles), Json::LogicError);
+        EXPECT_TRUE(db.profileGet("good", profile));
+        EXPECT_TRUE(db.profileSet("good", {"good", {}, {}}));
+        Json::Value exported;
+        EXPECT_TRUE(db.exportConfig(exported));
+        EXPECT_EQ(exported["config_profiles"].size(), 2u);
+        EXPECT_TRUE(FW::VELDFW_PROFILE().profileDelete("bad"));
     }
 }
 

@@ -4,14 +4,14 @@
 #include "utils/fileLock.h"
 #include "utils/jsonFile.h"
 
+#include <veld/core.h>
+
 #include <boost/interprocess/sync/file_lock.hpp>
 #include <sys/mman.h>
 #include <time.h>
 #include <unistd.h>
 
 #include <atomic>
-#include <chrono>
-#include <new>
 #include <thread>
 
 using namespace veldtest;
@@ -44,59 +44,82 @@ void waitUntilReady(Shared &shared, int count) {
         std::this_thread::yield();
 }
 
-/// Enters the lock many times. `unlinking` visitors take the lock file away as the last thing that they do inside.
-void visitOften(Shared &shared, bool unlinking) {
-    for (int i = 0; i < 150; ++i) {
-        FW::FileLock lock(lockPath);
-        if (!lock.lockUntil(FW::fileLockDeadline()))
-            continue;
-        if (shared.inside.fetch_add(1) != 0)
-            ++shared.intrusions;
-        std::this_thread::yield();
-        --shared.inside;
-        if (unlinking && i % 3 == 0)
-            unlink(lockPath.c_str());
-        ++shared.visits;
-    }
+/// Starts processes that do something at the same moment, and expects that each returns 0.
+void runAtOnce(const std::vector<std::function<int()>> &functions) {
+    Shared &shared = sharedMemory();
+    std::vector<pid_t> processes;
+    for (const auto &function : functions)
+        processes.push_back(startChild([&] {
+            waitUntilReady(shared, static_cast<int>(functions.size()));
+            return function();
+        }));
+    for (const pid_t process : processes)
+        EXPECT_EQ(waitForChild(process), 0);
+}
+
+/// Does something under the lock. @return false when the lock was not got
+using Visit = bool (*)(const std::function<void()> &inside);
+
+bool visitByStore(const std::function<void()> &inside) {
+    FW::FileLock lock(lockPath);
+    const bool locked = lock.lockUntil(FW::fileLockDeadline());
+    if (locked)
+        inside();
+    return locked;
+}
+
+bool visitByPlatform(const std::function<void()> &inside) {
+    int fd = -1;
+    if (VLIBCFileLockTimeByFile(lockPath.c_str(), 1, 30, &fd) != 1)
+        return false;
+    inside();
+    return VLIBCFileUnlockByFile(fd) != 0;
 }
 
 // No system log here: its thread would keep sanitized children from starting threads of their own.
-TEST(Locks, OnlyOneThreadOfOneProcessIsInsideAlsoWhenTheLockFileIsUnlinked) {
+class Locks : public testing::TestWithParam<Visit> {
+protected:
+    Locks() { FW::getLockFile(path); }
+};
+
+TEST_P(Locks, OnlyOneThreadOfOneProcessIsInsideAlsoWhenTheLockFileIsUnlinked) {
     for (const bool unlinking : {false, true}) {
         SCOPED_TRACE(unlinking ? "unlinked" : "kept");
         Shared &shared = sharedMemory();
-        FW::getLockFile(path);
-        std::vector<pid_t> processes;
-        for (int process = 0; process < 4; ++process) {
-            processes.push_back(startChild([&] {
-                std::vector<std::thread> threads;
-                for (int thread = 0; thread < 3; ++thread)
-                    threads.emplace_back([&] {
-                        waitUntilReady(shared, 12);
-                        visitOften(shared, unlinking);
-                    });
-                for (std::thread &thread : threads)
-                    thread.join();
-                return 0;
-            }));
-        }
-        for (const pid_t process : processes)
-            EXPECT_EQ(waitForChild(process), 0);
+        const auto visitOften = [&] {
+            waitUntilReady(shared, 12);
+            for (int i = 0; i < 150; ++i)
+                GetParam()([&] {
+                    if (shared.inside.fetch_add(1) != 0)
+                        ++shared.intrusions;
+                    std::this_thread::yield();
+                    --shared.inside;
+                    // The others wait for this file; from now on, whoever gets its lock has the lock of nothing.
+                    if (unlinking && i % 3 == 0)
+                        unlink(lockPath.c_str());
+                    ++shared.visits;
+                });
+        };
+        runAtOnce(std::vector<std::function<int()>>(4, [&] {
+            std::thread threads[] = {std::thread(visitOften), std::thread(visitOften), std::thread(visitOften)};
+            for (std::thread &thread : threads)
+                thread.join();
+            return 0;
+        }));
         EXPECT_EQ(shared.intrusions, 0);
         EXPECT_EQ(shared.visits, 12 * 150);
     }
 }
 
 /// Starts a process that holds the lock with Boost's file_lock for so long, and returns once it does.
-pid_t startBoostHolder(Shared &shared, std::chrono::milliseconds duration) {
+pid_t startBoostHolder(Shared &shared, unsigned seconds) {
     FW::getLockFile(path);
-    const pid_t holder = startChild([&shared, duration] {
+    const pid_t holder = startChild([&shared, seconds] {
         boost::interprocess::file_lock lock(lockPath.c_str());
         lock.lock();
         shared.held = true;
-        std::this_thread::sleep_for(duration);
+        sleep(seconds);
         shared.held = false;
-        lock.unlock();
         return 0;
     });
     while (!shared.held)
@@ -104,26 +127,23 @@ pid_t startBoostHolder(Shared &shared, std::chrono::milliseconds duration) {
     return holder;
 }
 
-double threadCpuSeconds() {
-    timespec used = {};
-    clock_gettime(CLOCK_THREAD_CPUTIME_ID, &used);
-    return static_cast<double>(used.tv_sec) + static_cast<double>(used.tv_nsec) * 1e-9;
-}
-
-class StoreLocks : public Store {};
-
-TEST_F(StoreLocks, AWaiterSleepsUntilTheHolderIsGone) {
-    store("1.json", "{}");
+TEST_P(Locks, AWaiterSleepsUntilTheHolderIsGone) {
     Shared &shared = sharedMemory();
-    const pid_t holder = startBoostHolder(shared, std::chrono::seconds(1));
-    const double before = threadCpuSeconds();
-    Json::Value value;
-    EXPECT_TRUE(FW::jsonFileLoad(value, path));
-    const double used = threadCpuSeconds() - before;
-    EXPECT_FALSE(shared.held);
-    EXPECT_LT(used, 0.020);
+    const pid_t holder = startBoostHolder(shared, 1);
+    timespec before = {};
+    timespec after = {};
+    clock_gettime(CLOCK_THREAD_CPUTIME_ID, &before);
+    EXPECT_TRUE(GetParam()([&] { EXPECT_FALSE(shared.held); }));
+    clock_gettime(CLOCK_THREAD_CPUTIME_ID, &after);
+    EXPECT_EQ(after.tv_sec, before.tv_sec);
+    EXPECT_LT(after.tv_nsec - before.tv_nsec, 20'000'000);
     EXPECT_EQ(waitForChild(holder), 0);
 }
+
+INSTANTIATE_TEST_SUITE_P(By, Locks, testing::Values(visitByStore, visitByPlatform),
+                         [](const auto &entry) { return entry.index == 0 ? "Store" : "Platform"; });
+
+class StoreLocks : public Store {};
 
 TEST_F(StoreLocks, AThreadOfTheSameProcessWaitsToo) {
     store("1.json", "{}");
@@ -134,10 +154,11 @@ TEST_F(StoreLocks, AThreadOfTheSameProcessWaitsToo) {
         EXPECT_TRUE(FW::jsonFileDump(json("{'name': 'n'}"), path));
         EXPECT_FALSE(held);
     });
-    Json::Value value;
     EXPECT_FALSE(FW::FileLock(lockPath).lockUntil(boost::posix_time::microsec_clock::universal_time() +
                                                   boost::posix_time::milliseconds(300)));
     EXPECT_EQ(storedText("1.json"), "{}");
+    EXPECT_THAT(runChecked({"ls", "-l", "/proc/" + std::to_string(getpid()) + "/fd"}), HasSubstr(".lock"));
+    EXPECT_THAT(runChecked({"ls", "-l", "/proc/self/fd"}), Not(HasSubstr(".lock"))) << "it reached a program";
     held = false;
     lock.reset();
     waiter.join();
@@ -147,14 +168,14 @@ TEST_F(StoreLocks, LoadAndDumpGiveUpAfterThirtySeconds) {
     store("1.json", "{}");
     store("deeper/1.json", "{}");  // shares the lock file
     Shared &shared = sharedMemory();
-    const pid_t holder = startBoostHolder(shared, std::chrono::seconds(60));
+    const pid_t holder = startBoostHolder(shared, 60);
     const auto start = std::chrono::steady_clock::now();
-    Json::Value value;
-    bool loaded = true;
-    std::thread loader([&] { loaded = FW::jsonFileLoad(value, profileDirectory + "deeper/1.json"); });
+    std::thread loader([&] {
+        Json::Value value;
+        EXPECT_FALSE(FW::jsonFileLoad(value, profileDirectory + "deeper/1.json"));
+    });
     EXPECT_FALSE(FW::jsonFileDump(json("[]"), path));
     loader.join();
-    EXPECT_FALSE(loaded);
     EXPECT_GE(std::chrono::steady_clock::now() - start, std::chrono::milliseconds(29'900));
     EXPECT_TRUE(shared.held);
     kill(holder, SIGKILL);
@@ -165,64 +186,44 @@ TEST_F(StoreLocks, LoadAndDumpGiveUpAfterThirtySeconds) {
     EXPECT_TRUE(FW::jsonFileDump(json("[]"), path)) << "the lock of a killed process is free";
 }
 
-TEST_F(StoreLocks, NoLockReachesAProgram) {
-    FW::FileLock lock(FW::getLockFile(path));
-    ASSERT_TRUE(lock.lockUntil(FW::fileLockDeadline()));
-    EXPECT_THAT(runChecked({"ls", "-l", "/proc/" + std::to_string(getpid()) + "/fd"}), HasSubstr(".lock"));
-    EXPECT_THAT(runChecked({"ls", "-l", "/proc/self/fd"}), Not(HasSubstr(".lock")));
-}
-
 TEST_F(StoreLocks, ReadersSeeWholeDocumentsWhileOthersReplaceAndRemoveThem) {
-    Shared &shared = sharedMemory();
     store("0.json", "{}");
     store("1.json", namedDocument("n"));
     Json::Value document = json(namedDocument("n"));
     for (int i = 0; i < 500; ++i)
         document["filling"].append(i);
-    const auto repeat = [&](const std::function<bool()> &action) {
-        return startChild([&shared, action] {
-            FW::VELDFW_JSON_DB().profileExist("n");
-            waitUntilReady(shared, 5);
+    const auto often = [](const std::function<bool()> &action) {
+        return [action] {
             for (int i = 0; i < 60; ++i) {
                 if (!action())
                     return 1;
             }
             return 0;
-        });
+        };
     };
-    std::vector<pid_t> processes;
-    for (int i = 0; i < 2; ++i)
-        processes.push_back(repeat([&] { return FW::jsonFileDump(document, path); }));
-    processes.push_back(repeat([] { return FW::VELDFW_JSON_DB().profileDbRemove("n"); }));
-    for (int i = 0; i < 2; ++i)
-        processes.push_back(repeat([] {
-            Json::Value seen;
-            FW::jsonFileLoad(seen, path);
-            return true;
-        }));
-    for (const pid_t process : processes)
-        EXPECT_EQ(waitForChild(process), 0);
+    const auto dump = often([&] { return FW::jsonFileDump(document, path); });
+    const auto load = often([] {
+        Json::Value seen;
+        FW::jsonFileLoad(seen, path);
+        return true;
+    });
+    runAtOnce({dump, dump, often([] { return FW::VELDFW_JSON_DB().profileDbRemove("n"); }), load, load});
     EXPECT_EQ(log.count("parse"), 0u) << log.text();
     EXPECT_EQ(log.count("rename"), 0u) << log.text();
 }
 
 TEST_F(StoreLocks, ProfilesThatProcessesCreateAtTheSameMomentAreAllKept) {
     store("1.json", namedDocument("first"));
-    Shared &shared = sharedMemory();
-    std::vector<pid_t> processes;
-    for (int process = 0; process < 10; ++process) {
-        processes.push_back(startChild([&, process] {
+    std::vector<std::function<int()>> creators;
+    for (const char letter : std::string("abcdefghij"))
+        creators.emplace_back([letter] {
             srand(1);  // all draw the same file names
-            waitUntilReady(shared, 10);
-            for (int i = 0; i < 4; ++i) {
-                if (!FW::VELDFW_PROFILE().profileCreate("p" + std::to_string(process) + "-" + std::to_string(i)))
-                    return 1;
-            }
-            return 0;
-        }));
-    }
-    for (const pid_t process : processes)
-        EXPECT_EQ(waitForChild(process), 0);
+            bool created = true;
+            for (int i = 0; i < 4; ++i)
+                created = FW::VELDFW_PROFILE().profileCreate(letter + std::to_string(i)) && created;
+            return created ? 0 : 1;
+        });
+    runAtOnce(creators);
     EXPECT_EQ(listDirectory(profileDirectory).size(), 41u);
     EXPECT_EQ(names().size(), 41u);
 }

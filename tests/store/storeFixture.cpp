@@ -56,11 +56,6 @@ std::vector<std::string> Store::takeErrors() {
     return errors;
 }
 
-std::string Store::takeLastError() {
-    const auto errors = takeErrors();
-    return errors.empty() ? "" : errors.back();
-}
-
 std::vector<std::string> Store::names() {
     std::vector<std::string> result;
     EXPECT_TRUE(db.profileEnum(result));

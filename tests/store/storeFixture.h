@@ -4,11 +4,7 @@
 #define VELD_TEST_STORE_FIXTURE_H
 
 #include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <json/value.h>
-
-#include <string>
-#include <vector>
 
 #include "files.h"
 #include "processes.h"
@@ -19,8 +15,6 @@
 
 namespace veldtest {
 
-/// Where the tables of cases lie.
-inline const std::string caseDirectory = VELD_CASE_DIRECTORY;
 inline const std::string profileDirectory = "/usr/veld/etc/firewall.d/";
 inline const std::string lockDirectory = "/var/lock/firewall/";
 inline const std::string settingsPath = profileDirectory + "firewall_settings.json";
@@ -42,8 +36,6 @@ protected:
     /// The messages logged since the last call, as "file.cpp text" when they have the form "file.cpp:line text" and
     /// error priority, else marked as odd.
     std::vector<std::string> takeErrors();
-    /// The last of them, empty when there is none.
-    std::string takeLastError();
     std::vector<std::string> names();
 
     SystemLog log;
