@@ -4,7 +4,6 @@
 
 #include "handle.h"
 #include "processes.h"
-#include "sandboxRoot.h"
 
 #include <linux/close_range.h>
 #include <sched.h>
@@ -15,6 +14,7 @@
 #include <csignal>
 #include <cstdio>
 #include <cstring>
+#include <filesystem>
 #include <fstream>
 #include <stdexcept>
 
@@ -43,6 +43,18 @@ void unshareNamespaces() {
     writeIdMap("/proc/self/uid_map", "0 " + std::to_string(uid) + " 1");
     writeIdMap("/proc/self/gid_map", "0 " + std::to_string(gid) + " 1");
     info.userNamespace = true;
+}
+
+/// Replaces "/" of this process's mount namespace. What leads to the program, the working directory and the build stays
+/// visible.
+void enterPrivateRoot() {
+    namespace fs = std::filesystem;
+    const std::string directory = fs::current_path();
+    runChecked({"sh", VELD_SOURCE_DIR "/tests/support/sandboxRoot.sh", info.userNamespace ? "links" : "overlay",
+                fs::read_symlink("/proc/self/exe"), directory, VELD_SOURCE_DIR, VELD_BINARY_DIR});
+    info.overlay = !fs::exists("/.host");
+    if (chdir(directory.c_str()) != 0 && chdir("/") != 0)
+        throw systemError("chdir /");
 }
 
 /// Process 1 of the sandbox: collects orphans until `main` has ended. When it exits, the kernel ends all the others.
@@ -85,7 +97,7 @@ int runInSandbox(const std::function<int()> &body, const std::function<int(const
         if (first != 0)
             _exit(waitForChild(first));
         prctl(PR_SET_PDEATHSIG, SIGKILL);
-        info.overlay = enterPrivateRoot(!info.userNamespace);
+        enterPrivateRoot();
         runChecked({"ip", "link", "set", "lo", "up"});
         entered = true;
         const pid_t main = forkOrThrow();
