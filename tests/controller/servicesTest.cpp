@@ -1,9 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
-// What the controller learns from the system: services for stored profiles, adapters for callers.
+// What is learnt from the system: services for stored profiles, adapters and countries for callers.
 #include "caseTable.h"
 #include "files.h"
 #include "firewallTest.h"
 #include "network.h"
+#include "veldfirewall/fwGeoip.h"
 
 using namespace veldtest;
 using testing::ElementsAre;
@@ -75,6 +76,31 @@ TEST_F(FirewallTest, CommandListNeedsAProfileAndKeepsTheOthersConnections) {
     EXPECT_EQ(client["v4"]["global"][1],
               "-A INPUT_FIREWALL ! -s 10.0.0.9 -m state --state ESTABLISHED,RELATED -j ACCEPT");
     EXPECT_EQ(client["v6"]["global"][6], "-A INPUT_FIREWALL -m state --state ESTABLISHED,RELATED -j ACCEPT");
+}
+
+// What country files give is checked by their fuzz target.
+TEST_F(FirewallTest, CountriesAreThoseWithIv4AnywhereInANameAndUsableWithEightBytes) {
+    const std::string directory = "/usr/share/xt_geoip/";
+    for (const char *name : {"DE.iv4", "de.iv4.old", "FR.iv6", "x.iv4", "README", "USA.iv4"})
+        writeFile(directory + name, name == std::string("DE.iv4") ? "8 bytes." : "7 bytes");
+    FW::FW_GEOIP geoip;
+    std::vector<std::string> countries = {"before"};
+    EXPECT_TRUE(geoip.countryEnum(countries));
+    EXPECT_THAT(countries, testing::UnorderedElementsAre("before", "DE", "de", "x.", "US"));
+    std::vector<std::string> usable;
+    EXPECT_TRUE(geoip.geoipSanctify({"USA", "DE", "XX", "DE"}, false, usable));
+    EXPECT_THAT(usable, ElementsAre("DE", "DE"));
+    EXPECT_TRUE(geoip.geoipSanctify({"XX"}, false, usable)) << "what was usable before counts";
+    usable.clear();
+    EXPECT_FALSE(geoip.geoipSanctify({"FR", "DE"}, true, usable)) << "of that family";
+    EXPECT_FALSE(geoip.geoipSanctify({}, true, usable));
+    removeAll(directory);
+    EXPECT_FALSE(geoip.countryEnum(countries));
+    Json::Value none;
+    EXPECT_FALSE(geoip.countryIPGet("XX", true, none));
+    for (const char *message : {"There are no country", "Failed to opendir /usr/share/xt_geoip/",
+                                "Failed to open file /usr/share/xt_geoip/XX.iv6", "Failed to read geoip database"})
+        EXPECT_TRUE(log.contains(message)) << log.text();
 }
 
 }  // namespace

@@ -10,7 +10,6 @@
 #include <cstdio>
 #include <fstream>
 #include <sstream>
-#include <stdexcept>
 
 namespace veldtest {
 namespace {
@@ -45,25 +44,22 @@ CommandRecorder::~CommandRecorder() {
     }
 }
 
-void CommandRecorder::addRule(const std::vector<std::string> &fields) {
-    std::ofstream out(RECORDER_RULES, std::ios::app | std::ios::binary);
-    for (const auto &field : fields)
-        out << field << '\0';
-    out.close();
-    if (!out)
-        throw std::runtime_error("cannot write " RECORDER_RULES);
+void CommandRecorder::addRule(unsigned run, int status, unsigned milliseconds, const std::string &part,
+                              const std::string &errorText) {
+    std::ofstream(RECORDER_RULES, std::ios::app)
+        << run << ' ' << status << ' ' << milliseconds * 1'000'000 << '\t' << part << "\t=" << errorText << '\n';
 }
 
 void CommandRecorder::failAt(unsigned n, int status, const std::string &errorText) {
-    addRule({"at", std::to_string(n), std::to_string(status), errorText});
+    addRule(n, status, 0, "/", errorText);
 }
 
 void CommandRecorder::failMatching(const std::string &part, int status, const std::string &errorText) {
-    addRule({"matching", part, std::to_string(status), errorText});
+    addRule(0, status, 0, part, errorText);
 }
 
 void CommandRecorder::setDelay(unsigned milliseconds) {
-    addRule({"delay", std::to_string(milliseconds), "0", ""});
+    addRule(0, 0, milliseconds, "/", "");
 }
 
 std::vector<RecordedCommand> CommandRecorder::commands() const {

@@ -30,7 +30,7 @@ public:
     void failAt(unsigned n, int status = 1, const std::string &errorText = "");
     /// Lets every run fail whose line() holds `part`. The first rule that applies counts.
     void failMatching(const std::string &part, int status = 1, const std::string &errorText = "");
-    /// Lets every run last this long, after it was recorded.
+    /// Lets every run last this long (less than a second), after it was recorded.
     void setDelay(unsigned milliseconds);
 
     /// All runs in the order of their starts.
@@ -41,7 +41,8 @@ public:
     void clear();
 
 private:
-    void addRule(const std::vector<std::string> &fields);
+    void addRule(unsigned run, int status, unsigned milliseconds, const std::string &part,
+                 const std::string &errorText);
 
     std::vector<std::string> m_programs;
 };

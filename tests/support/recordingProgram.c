@@ -40,50 +40,33 @@ static long record(int argc, char **argv) {
     return run;
 }
 
-/* Program and arguments joined by single blanks. */
-static char *join(int argc, char **argv) {
-    char *line = NULL;
-    size_t size = 0;
-    FILE *out = open_memstream(&line, &size);
-    for (int i = 0; i < argc; ++i)
-        fprintf(out, "%s%s", i == 0 ? "" : " ", argv[i]);
-    fclose(out);
-    return line;
-}
-
-/* Takes the next field; NULL at the end. */
-static char *nextField(FILE *file) {
-    char *field = NULL;
-    size_t size = 0;
-    return getdelim(&field, &size, 0, file) < 0 ? NULL : field;
-}
-
-/* Waits, and returns the exit status that the first rule that applies gives. What is allocated goes with the process.
- */
+/* Waits, and returns the exit status that the first rule that applies gives. */
 static int applyRules(long run, const char *line) {
     FILE *file = fopen(RECORDER_RULES, "re");
     if (file == NULL)
         broken(RECORDER_RULES);
-    for (char *kind; (kind = nextField(file)) != NULL;) {
-        char *value = nextField(file);
-        char *status = nextField(file);
-        char *message = nextField(file);
-        if (message == NULL)
-            broken("rule without end in " RECORDER_RULES);
-        const long number = strtol(value, NULL, 10);
-        if (strcmp(kind, "delay") == 0) {
-            const struct timespec pause = {number / 1000, number % 1000 * 1000000};
-            nanosleep(&pause, NULL);
-        } else if (strcmp(kind, "at") == 0 ? number == run : strstr(line, value) != NULL) {
-            if (*message != 0)
-                fprintf(stderr, "%s\n", message);
-            return (int)strtol(status, NULL, 10);
-        }
+    struct timespec pause = {0, 0};
+    char part[1024], message[1024];
+    int status = 0;
+    for (long number; fscanf(file, RECORDER_RULE_FORMAT, &number, &status, &pause.tv_nsec, part, message) == 5;) {
+        if ((number != 0 && number != run) || strstr(line, part) == NULL)
+            continue;
+        nanosleep(&pause, NULL);
+        if (message[1] != 0)
+            fprintf(stderr, "%s\n", message + 1);
+        if (status != 0)
+            return status;
     }
     return 0;
 }
 
 int main(int argc, char **argv) {
     const long run = record(argc, argv);
-    return applyRules(run, join(argc, argv));
+    char *line = NULL; /* program and arguments joined by single blanks */
+    size_t size = 0;
+    FILE *out = open_memstream(&line, &size);
+    for (int i = 0; i < argc; ++i)
+        fprintf(out, "%s%s", i == 0 ? "" : " ", argv[i]);
+    fclose(out);
+    return applyRules(run, line);
 }

@@ -8,7 +8,9 @@
  * END_OF_RUN. */
 #define RECORDER_RECORD RECORDER_DIRECTORY "/record"
 #define END_OF_RUN '\036'
-/* Per rule, each field followed by NUL: "at" | "matching" | "delay", its value, exit status, text for stderr. */
+/* A rule per line: number of the run or 0, exit status, nanoseconds to wait; after a tab each, a part of the command
+ * and "=" with a text for stderr. */
 #define RECORDER_RULES RECORDER_DIRECTORY "/rules"
+#define RECORDER_RULE_FORMAT "%ld %d %ld\t%1023[^\t]\t%1023[^\n]"
 
 #endif
