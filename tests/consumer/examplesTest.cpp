@@ -19,7 +19,7 @@ constexpr const char *preparation = R"(
     PATH=$VELD_EXAMPLES/bin:$PATH
     settings=/usr/veld/etc/firewall.d/firewall_settings.json
     reach() { nsenter --net=/run/netns/client timeout 1 bash -c "exec 2>&- 3<>/dev/tcp/10.1.0.1/$1"; }
-    rules() { iptables -S INPUT_FIREWALL | grep -e -A; }
+    rules() { ip$1tables -S INPUT_FIREWALL | grep -e -A; }
     LD_LIBRARY_PATH=$(dirname $(find $VELD_EXAMPLES/installed -name libveldfirewall.so.1))
     export LD_LIBRARY_PATH
 )";

@@ -3,10 +3,8 @@
 #include "firewallTest.h"
 
 #include <json/json.h>
-#include <syslog.h>
 
 #include <boost/interprocess/sync/file_lock.hpp>
-#include <regex>
 #include <sstream>
 
 #include "caseTable.h"
@@ -47,17 +45,6 @@ std::vector<std::string> FirewallTest::takeHookRuns() {
 
 bool FirewallTest::execLockIsFree() {
     return boost::interprocess::file_lock(EXEC_LOCK).try_lock();
-}
-
-std::vector<std::string> FirewallTest::errors() {
-    static const std::regex own("((?:veldFW|fwHook|fwIptables|veldIptablesModule|fwGeoip)\\.cpp):[0-9]+( [^]*)");
-    std::vector<std::string> texts;
-    std::smatch parts;
-    for (const LogMessage &message : log.messages()) {
-        if (message.priority == LOG_ERR && std::regex_match(message.text, parts, own))
-            texts.push_back(parts.str(1) + parts.str(2));
-    }
-    return texts;
 }
 
 FW::FWRULE portRule(const std::string &port, FW::FW_POLICY policy) {

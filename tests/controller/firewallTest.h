@@ -35,8 +35,8 @@ protected:
     static std::vector<std::string> takeHookRuns();
     /// Whether another process could take the lock now.
     static bool execLockIsFree();
-    /// Error messages of the library, without line numbers: "veldFW.cpp Failed to check status".
-    std::vector<std::string> errors();
+    /// Error messages of what runs above the store.
+    std::vector<std::string> errors() { return log.errors("veldFW|fwHook|fwIptables|veldIptablesModule|fwGeoip"); }
 
     SystemLog log;
     FW::VELDFW firewall;

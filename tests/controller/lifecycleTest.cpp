@@ -134,29 +134,24 @@ TEST_F(Lifecycle, EveryCommandThatFailsLeavesADefinedState) {
 TEST_F(Lifecycle, ProfileThatCannotBeAppliedRestoresAcceptAndTheFirewallStaysOn) {
     ASSERT_TRUE(firewall.fwEnable()) << log.text();
     takeHookRuns();
-    struct Row {
-        const char *active;
-        const char *rulePolicy;
-        const char *error;  ///< the last; null: an exception of the conversion passes
-    };
-    const Row rows[] = {
+    // The settings, the policy of a rule, and the last error; none: an exception of the conversion passes.
+    const std::tuple<std::string, std::string, std::string> rows[] = {
         {R"({"status": true})", "1", "veldFW.cpp Failed to fwProfileConfigGet()"},
         {R"({"status": true, "profile": "gone"})", "1", "veldFW.cpp Failed to fwIptablesRulesEnum()"},
         {R"({"status": true, "profile": "default"})", "9", "veldFW.cpp Failed to fwIptablesRulesEnum()"},
-        {R"({"status": true, "profile": "default"})", "{}", nullptr},
+        {R"({"status": true, "profile": "default"})", "{}", ""},
     };
-    for (const Row &row : rows) {
-        SCOPED_TRACE(std::string(row.active) + ", policy " + row.rulePolicy);
-        writeFile(SETTINGS, row.active);
-        writeFile(PROFILE, R"({"name": "default", "rules": {"global": [{"policy": )" + std::string(row.rulePolicy) +
-                               R"(, "enable": true}]}})");
+    for (const auto &[settings, policy, error] : rows) {
+        SCOPED_TRACE(settings + ", policy " + policy);
+        writeFile(SETTINGS, settings);
+        writeFile(PROFILE, R"({"name": "default", "rules": {"global": [{"enable": true, "policy": )" + policy + "}]}}");
         recorder.clear();
         log.clear();
-        if (row.error == nullptr) {
+        if (error.empty()) {
             EXPECT_THROW(firewall.fwReload(true), Json::Exception);
         } else {
             EXPECT_FALSE(firewall.fwReload(true));
-            ASSERT_THAT(errors(), Contains(row.error));
+            ASSERT_THAT(errors(), Contains(error));
         }
         EXPECT_THAT(recorder.lines(), ElementsAreArray(SET_DROP + FLUSH + SET_ACCEPT));
         EXPECT_TRUE(isSwitchedOn());

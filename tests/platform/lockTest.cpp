@@ -84,32 +84,4 @@ TEST(FileLock, WhatAnotherUserPlantedIsReplacedByTheHolderOfTheGuardAndNeverFoll
     EXPECT_TRUE(log.contains("is a symbolic link and cannot be removed")) << log.text();
 }
 
-TEST(FileLock, ManyProcessesReplacingAPlantedFileNeverLetTwoIn) {
-    SKIP_WITHOUT_OTHER_USERS();
-    const auto beAlone = [] {
-        const int fd = takeLock(60);
-        const bool entered = fd >= 0 && mkdir("/run/inside", 0700) == 0;
-        usleep(200);
-        return entered && rmdir("/run/inside") == 0 && VLIBCFileUnlockByFile(fd) != 0;
-    };
-    for (int round = 0; round < 150; ++round) {
-        unlink(path.c_str());
-        ASSERT_EQ(asStranger([] { return writeFile(path, "", 0666), true; }), 0);
-        int gate[2];
-        ASSERT_EQ(pipe(gate), 0);
-        std::vector<pid_t> children;
-        for (int i = 0; i < 6; ++i)
-            children.push_back(startChild([&] {
-                // All start at once, when the gate's last writer closes it.
-                close(gate[1]);
-                char none = 0;
-                return read(gate[0], &none, 1) == 0 && beAlone() ? 0 : 1;
-            }));
-        close(gate[0]);
-        close(gate[1]);
-        for (const pid_t child : children)
-            ASSERT_EQ(waitForChild(child), 0);
-    }
-}
-
 }  // namespace

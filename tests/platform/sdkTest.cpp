@@ -45,19 +45,6 @@ TEST(MkdirP, CreatesParentsAcceptsWhatIsThereAndTellsWhatFails) {
     EXPECT_EQ(info.st_mode & 07700U, 0700U) << "parents can be entered by their owner";
 }
 
-TEST(MkdirP, ManyCreatorsAtOnceAllSucceed) {
-    std::vector<pid_t> children;
-    for (int i = 0; i < 8; ++i)
-        children.push_back(startChild([] {
-            int failures = 0;
-            for (int n = 0; n < 50; ++n)
-                failures += VELDFSMkdirP(("/run/race/" + std::to_string(n) + "/a/b/c/d").c_str(), 0755) == 0 ? 0 : 1;
-            return failures;
-        }));
-    for (const pid_t child : children)
-        EXPECT_EQ(waitForChild(child), 0);
-}
-
 TEST(MkdirP, DirectoryPlantedInASharedOneIsRefused) {
     SKIP_WITHOUT_OTHER_USERS();
     SystemLog log;

@@ -3,10 +3,8 @@
 #include "storeFixture.h"
 
 #include <json/reader.h>
-#include <syslog.h>
 
 #include <algorithm>
-#include <regex>
 #include <sstream>
 
 namespace veldtest {
@@ -45,13 +43,8 @@ Store::Store() {
 }
 
 std::vector<std::string> Store::takeErrors() {
-    static const std::regex form(R"((\w+\.cpp):[1-9][0-9]* ((.|\n)*))");
-    std::vector<std::string> errors;
-    for (const LogMessage &message : log.messages()) {
-        std::smatch parts;
-        const bool regular = message.priority == LOG_ERR && std::regex_match(message.text, parts, form);
-        errors.push_back(regular ? parts.str(1) + " " + parts.str(2) : "odd: " + message.text);
-    }
+    const auto errors = log.errors();
+    EXPECT_EQ(errors.size(), log.messages().size()) << log.text();
     log.clear();
     return errors;
 }

@@ -33,8 +33,7 @@ void storeSettings(const std::string &activeProfile);
 class Store : public testing::Test {
 protected:
     Store();
-    /// The messages logged since the last call, as "file.cpp text" when they have the form "file.cpp:line text" and
-    /// error priority, else marked as odd.
+    /// The errors logged since the last call; expects no other messages.
     std::vector<std::string> takeErrors();
     std::vector<std::string> names();
 

@@ -5,7 +5,6 @@
 #include "handle.h"
 
 #include <fcntl.h>
-#include <spawn.h>
 #include <sys/mman.h>
 #include <sys/wait.h>
 
@@ -62,23 +61,19 @@ int runInChild(const std::function<int()> &function) {
 
 ProgramResult runProgram(const std::vector<std::string> &command) {
     std::vector<char *> arguments;
-    arguments.reserve(command.size() + 1);
     for (const auto &word : command)
         arguments.push_back(const_cast<char *>(word.c_str()));
     arguments.push_back(nullptr);
+    const Handle input(open("/dev/null", O_RDONLY | O_CLOEXEC), "open /dev/null");
     const Handle output = makeBuffer();
     const Handle errors = makeBuffer();
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_addopen(&actions, 0, "/dev/null", O_RDONLY, 0);
-    posix_spawn_file_actions_adddup2(&actions, output.get(), 1);
-    posix_spawn_file_actions_adddup2(&actions, errors.get(), 2);
-    pid_t child = -1;
-    const int error = posix_spawnp(&child, arguments[0], &actions, nullptr, arguments.data(), environ);
-    posix_spawn_file_actions_destroy(&actions);
-    if (error != 0)
-        throw systemError("start " + command[0], error);
-    const int status = waitForChild(child);
+    const int status = runInChild([&] {
+        for (const auto &[from, to] : {std::pair(&input, 0), {&output, 1}, {&errors, 2}})
+            dup2(from->get(), to);
+        execvp(arguments[0], arguments.data());
+        throw systemError("start " + command[0]);
+        return 0;
+    });
     return {status, readBuffer(output), readBuffer(errors)};
 }
 

@@ -26,8 +26,8 @@ int runInChild(const std::function<int()> &function);
 pid_t startChild(const std::function<int()> &function);
 /// Waits for a child: its exit status or 128 + signal.
 int waitForChild(pid_t child);
-/// Runs a program (looked up in PATH unless it holds a slash) without a shell and waits for it. Throws
-/// std::system_error when it cannot be started.
+/// Runs a program (looked up in PATH unless it holds a slash) without a shell and waits for it. When it cannot be
+/// started, the status is 125, and `errors` says why.
 ProgramResult runProgram(const std::vector<std::string> &command);
 /// The same, and throws std::runtime_error with the command and what it printed unless it exits with 0.
 std::string runChecked(const std::vector<std::string> &command);

@@ -14,20 +14,6 @@
 
 namespace {
 
-/// Stands in front of all tests and skips or fails each of them.
-class UnavailableSandbox : public testing::EmptyTestEventListener {
-public:
-    explicit UnavailableSandbox(std::string reason) : m_reason(std::move(reason)) {}
-    void OnTestStart(const testing::TestInfo &) override {
-        if (std::getenv("CI") != nullptr)
-            GTEST_FAIL() << "no sandbox, and with CI set that is a failure: " << m_reason;
-        GTEST_SKIP() << "no sandbox: " << m_reason;
-    }
-
-private:
-    std::string m_reason;
-};
-
 int runTests() {
     int result = RUN_ALL_TESTS();
 #if defined(__SANITIZE_ADDRESS__)
@@ -45,7 +31,9 @@ int main(int argc, char **argv) {
     if (testing::GTEST_FLAG(list_tests))
         return RUN_ALL_TESTS();
     return veldtest::runInSandbox(runTests, [](const std::string &reason) {
-        testing::UnitTest::GetInstance()->listeners().Append(new UnavailableSandbox(reason));
-        return RUN_ALL_TESTS();
+        const bool mustWork = std::getenv("CI") != nullptr;
+        std::printf("%s no sandbox: %s\n", mustWork ? "With CI set that is a failure:" : "[  SKIPPED ]",
+                    reason.c_str());
+        return mustWork ? 1 : 0;
     });
 }

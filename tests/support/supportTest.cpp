@@ -4,13 +4,9 @@
 #include "files.h"
 #include "processes.h"
 #include "sandbox.h"
-#include "systemLog.h"
 
 #include <gtest/gtest.h>
-#include <syslog.h>
 #include <unistd.h>
-
-#include <csignal>
 
 using namespace veldtest;
 
@@ -35,26 +31,6 @@ TEST(Sandbox, WhatBelongsToTheMachineIsHidden) {
     const auto links = runChecked({"ip", "-br", "link", "show"});
     EXPECT_EQ(links.substr(0, 3), "lo ");
     EXPECT_EQ(links.find('\n'), links.size() - 1) << links;
-}
-
-TEST(Processes, ResultsOfChildrenAndProgramsAreSeen) {
-    EXPECT_EQ(runInChild([] { return raise(SIGKILL); }), 128 + SIGKILL);
-    const auto result = runProgram({"sh", "-c", "echo out; echo err >&2; exit 3"});
-    EXPECT_EQ(result.status, 3);
-    EXPECT_EQ(result.output + result.errors, "out\nerr\n");
-}
-
-TEST(SystemLog, MessagesOfThisProcessAndItsChildrenArriveInOrderEvenInLargeNumbers) {
-    SystemLog log;
-    for (int i = 0; i < 2000; ++i)
-        syslog(LOG_ERR, "veldFW.cpp:%d message", i);
-    runInChild([] { return syslog(LOG_DEBUG, "from: a child"), 0; });
-    const auto messages = log.messages();
-    ASSERT_EQ(messages.size(), 2001u);
-    EXPECT_EQ(messages[1999].text, "veldFW.cpp:1999 message");
-    EXPECT_EQ(messages[1999].priority, LOG_ERR);
-    EXPECT_EQ(messages[2000].text, "from: a child");
-    EXPECT_EQ(messages[2000].priority, LOG_DEBUG);
 }
 
 TEST(CommandRecorder, ArgumentsAndInheritedDescriptorsAreSeenAsTheyAre) {

@@ -14,6 +14,7 @@
 #include <algorithm>
 #include <array>
 #include <cstring>
+#include <regex>
 
 namespace veldtest {
 namespace {
@@ -83,6 +84,17 @@ size_t SystemLog::count(const std::string &part) {
 
 bool SystemLog::contains(const std::string &part) {
     return count(part) > 0;
+}
+
+std::vector<std::string> SystemLog::errors(const std::string &files) {
+    const std::regex form("((?:" + files + ")\\.cpp):[1-9][0-9]*( [^]*)");
+    std::vector<std::string> texts;
+    std::smatch parts;
+    for (const auto &message : messages()) {
+        if (message.priority == LOG_ERR && std::regex_match(message.text, parts, form))
+            texts.push_back(parts.str(1) + parts.str(2));
+    }
+    return texts;
 }
 
 std::string SystemLog::text() {

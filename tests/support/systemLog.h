@@ -33,6 +33,9 @@ public:
     bool contains(const std::string &part);
     /// How many messages have texts that hold `part`.
     size_t count(const std::string &part);
+    /// The error messages of these source files of the library, without line numbers: "veldFW.cpp Failed to unlock".
+    /// @param files a regular expression of their names without ".cpp"
+    std::vector<std::string> errors(const std::string &files = "\\w+");
     /// All texts, a line each, for failure messages.
     std::string text();
     /// Forgets the messages sent up to now.
