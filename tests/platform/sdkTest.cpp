@@ -4,9 +4,6 @@
 #include "planting.h"
 #include "sdk/hookDirectory.h"
 #include "systemLog.h"
-#include "veld/core.h"
-
-#include <csignal>
 
 using namespace veldtest;
 
@@ -91,19 +88,6 @@ TEST(Hook, FailingAndHangingProgramsAreNamedAndTheOthersStillRun) {
     // The hook's own child ends, too. An orphan stays a zombie until process 1 has collected it.
     EXPECT_EQ(runProgram({"sh", "-c", "while grep -q 'State:.[^Z]' /proc/$(cat /run/child)/status; do :; done"}).status,
               0);
-}
-
-TEST(Hook, DaemonLeftBehindHoldsNeitherTheActionNorALock) {
-    int lock = -1;
-    ASSERT_EQ(VLIBCFileLockTimeByFile("/run/a.lock", 1, 0, &lock), 1);
-    const int copy = dup(lock);  // without close-on-exec
-    installHook("daemon", "sleep 1000 & echo $! > /run/daemon");
-    EXPECT_EQ(runHook(VLIB_PLUGIN_POST), 0);
-    // Closed without unlocking: a copy of the descriptor elsewhere would keep the lock.
-    close(copy);
-    close(lock);
-    EXPECT_EQ(VLIBCFileLockTimeByFile("/run/a.lock", 1, 0, &lock), 1);
-    EXPECT_EQ(kill(std::stoi(readFile("/run/daemon")), SIGKILL), 0) << "it had ended, so that nothing was shown";
 }
 
 }  // namespace

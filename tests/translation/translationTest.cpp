@@ -3,8 +3,6 @@
 #include <syslog.h>
 
 #include <algorithm>
-#include <filesystem>
-#include <fstream>
 #include <optional>
 #include <stdexcept>
 
@@ -103,23 +101,19 @@ void TranslationCase::applyLine(int line, const std::string &key, const std::str
 }
 
 void TranslationCase::read(const std::string &name) {
-    std::ifstream file(std::string(VELD_CASE_DIRECTORY "/") + name);
-    if (!file)
-        throw std::runtime_error(name + ": cannot be opened");
     std::string group;
     int number = 0;
-    for (std::string line; std::getline(file, line);) {
+    for (const std::string &line : split(readFile(VELD_CASE_DIRECTORY "/" + name), '\n')) {
         ++number;
         if (line.empty() || line.front() == '#')
             continue;
         try {
             if (line.front() == ' ') {
                 commands.at(group) += line + "\n";
-                continue;
+            } else {
+                group = line;
+                applyLine(number, cut(line, ' ').first, cut(line, ' ').second);
             }
-            group = line;
-            const auto [key, rest] = cut(line, ' ');
-            applyLine(number, key, rest);
         } catch (const std::logic_error &) {
             throw std::runtime_error(name + ":" + std::to_string(number) + ": not understood: " + line);
         }
@@ -183,9 +177,9 @@ TEST_P(Translation, GivesTheCommandsOfTheCase) {
 
 Words caseNames() {
     Words names;
-    for (const auto &entry : std::filesystem::directory_iterator(VELD_CASE_DIRECTORY)) {
-        if (entry.path().extension() == ".case")
-            names.push_back(entry.path().stem());
+    for (const std::string &file : listDirectory(VELD_CASE_DIRECTORY)) {
+        if (cut(file, '.').second == "case")
+            names.push_back(cut(file, '.').first);
     }
     return names;
 }
