@@ -24,13 +24,13 @@ mkdir $stage/upper $stage/work $root
 overlay() {
     layers=lowerdir=/,upperdir=$stage/upper,workdir=$stage/work
     mount -t overlay -o $layers overlay $root || mount -t overlay -o $layers,userxattr overlay $root || return 1
-    mkdir $root/usr/sbin/.sandbox-probe && rmdir $root/usr/sbin/.sandbox-probe || { umount $root && return 1; }
+    mkdir -p $root/.host $root/usr/veld || { umount $root && return 1; }
 }
 
 # An overlay shows one mount only: the other mounts of the machine are bound in. Files that are mounts (a container's
 # /etc/hosts) are copied, because a mount point cannot be replaced.
 bind_other_mounts() {
-    cut -d' ' -f2 /proc/self/mounts | sort -u | while read -r point; do
+    while read -r _ point _; do
         case $point/ in
             // | /proc/* | /sys/* | /dev/* | /tmp/* | /run/* | /usr/veld/* | $stage/*) continue ;;
         esac
@@ -39,7 +39,7 @@ bind_other_mounts() {
         elif [ -f "$point" ]; then
             cp --remove-destination "$point" "$root$point"
         fi || true
-    done
+    done </proc/self/mounts
 }
 
 # Fills the new root with links: directories in which tests create or replace entries are directories of links.
@@ -68,21 +68,33 @@ link_all() {
 
 if [ "$kind" = overlay ] && overlay; then bind_other_mounts; else kind=links && link_all; fi
 
-mkdir -p $root/proc $root/sys $root/dev $root/tmp $root/run $root/usr/veld
-for path in /tmp /run /usr/veld /dev; do echo "sandbox $root$path tmpfs mode=755"; done >$stage/fstab
+mkdir -p $root/.host $root/proc $root/sys $root/dev $root/tmp $root/run $root/usr/veld
+for path in /run /usr/veld /dev; do echo "sandbox $root$path tmpfs mode=755"; done >$stage/fstab
+echo "sandbox $root/tmp tmpfs mode=1777" >>$stage/fstab
 mount --all --fstab $stage/fstab
-mkdir -m 1777 $root/run/lock $root/dev/shm
-chmod 1777 $root/tmp
+mkdir -m 1777 $root/run/lock $root/dev/shm $root/dev/net $root/dev/pts
 # Usually a link to /run/lock, and then fresh already.
 [ -L $root/var/lock ] || { mkdir -p $root/var/lock && mount -t tmpfs -o mode=1777 sandbox $root/var/lock; }
-mkdir $root/dev/net $root/dev/pts
-for device in null zero full random urandom tty net/tun; do
-    [ ! -e /dev/$device ] || { : >$root/dev/$device && echo "/dev/$device $root/dev/$device none bind"; }
-done >$stage/fstab
-mount --all --fstab $stage/fstab
-mount -t devpts -o newinstance,ptmxmode=0666,mode=0620 devpts $root/dev/pts || mount --rbind /dev/pts $root/dev/pts
 ln -s pts/ptmx $root/dev/ptmx
 cp -P /dev/fd /dev/stdin /dev/stdout /dev/stderr $root/dev
+
+# Kernel modules belong to the whole machine: without a list of what is there and what is loaded, none is loaded or
+# removed. The kernel itself still loads what a rule needs.
+{
+    for device in null zero full random urandom tty net/tun; do
+        [ ! -e /dev/$device ] || echo "/dev/$device $root/dev/$device none bind"
+        : >$root/dev/$device
+    done
+    echo "devpts $root/dev/pts devpts newinstance,ptmxmode=0666,mode=0620"
+    echo "proc $root/proc proc nosuid,nodev,noexec"
+    echo "sysfs $root/sys sysfs nosuid,nodev,noexec"
+    for path in /sys/module /usr/lib/modules; do [ ! -d $path ] || echo "sandbox $root$path tmpfs mode=755"; done
+} >$stage/fstab
+# Where the machine hides parts of its own, the kernel allows no new ones.
+mount --all --fstab $stage/fstab || {
+    for path in /dev/pts /proc /sys; do mountpoint -q $root$path || mount --rbind $path $root$path; done
+    mountpoint -q $root/sys/module || [ ! -d $root/sys/module ] || mount -t tmpfs sandbox $root/sys/module
+}
 
 for path; do
     for fresh in /tmp /run /usr/veld /dev; do
@@ -92,16 +104,6 @@ for path; do
     done
 done
 
-# Of this pid and network namespace; where the machine hides parts of its own, the kernel allows no new ones.
-mount -t proc -o nosuid,nodev,noexec proc $root/proc || mount --rbind /proc $root/proc
-mount -t sysfs -o nosuid,nodev,noexec sysfs $root/sys || mount --rbind /sys $root/sys
-# Kernel modules belong to the whole machine: without a list of what is there and what is loaded, none is loaded or
-# removed. The kernel itself still loads what a rule needs.
-for path in /sys/module /usr/lib/modules; do
-    [ ! -d $root$path ] || mount -t tmpfs -o mode=755 sandbox $root$path
-done
-
-mkdir -p $root/.host
 cd $root
 pivot_root . .host
 [ $kind = links ] || { umount -l /.host && rmdir /.host; }
