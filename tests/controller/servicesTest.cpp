@@ -71,8 +71,9 @@ TEST_F(FirewallTest, CommandListNeedsAProfileAndKeepsTheOthersConnections) {
     EXPECT_FALSE(firewall.fwIptablesRulesEnum("default", commands, "somewhere"));
     EXPECT_THAT(errors(), testing::IsSupersetOf({"veldFW.cpp Failed to profileGet(gone)",
                                                  "veldFW.cpp Failed to fwRulesToIptablesRules()"}));
-    EXPECT_TRUE(firewall.fwIptablesRulesEnum("default", commands = {}, "10.0.0.9"));
-    EXPECT_EQ(commands["v4"]["global"][1],
+    Json::Value kept;
+    EXPECT_TRUE(firewall.fwIptablesRulesEnum("default", kept, "10.0.0.9"));
+    EXPECT_EQ(kept["v4"]["global"][1],
               "-A INPUT_FIREWALL ! -s 10.0.0.9 -m state --state ESTABLISHED,RELATED -j ACCEPT");
 }
 
