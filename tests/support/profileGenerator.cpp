@@ -1,5 +1,5 @@
 // SPDX-License-Identifier: Apache-2.0
-// Profiles with rules of every kind that the kernel takes.
+// Drawn profiles.
 #include "profileGenerator.h"
 
 namespace veldtest {
@@ -22,6 +22,55 @@ FWPROFILE ProfileGenerator::profile(const std::string &name, int rulesPerAdapter
         }
         profile.adapterPolicyMap[adapter] =
             adapter == "global" && chance(80) ? FW_POLICY_NONE : static_cast<FW_POLICY>(below(3));
+    }
+    return profile;
+}
+
+FWPROFILE ProfileGenerator::wildProfile(const std::string &name, int rulesPerAdapter) {
+    FWPROFILE profile = this->profile(name, rulesPerAdapter);
+    profile.rules["vpn"] = {rule("eth0"), rule("eth1")};
+    profile.rules["absent"] = {rule("eth0")};
+    for (auto &[adapter, rules] : profile.rules) {
+        for (FWRULE &rule : rules) {
+            rule.name = "a \"name\" " + std::to_string(below(1000));
+            rule.labelList = {"a \"label\"", "#"};
+            rule.policy = oneOf<FW_POLICY>({FW_POLICY_ALLOW, FW_POLICY_DENY, FW_POLICY_NONE});
+            rule.table = oneOf<std::string>({"filter", "filter", "filter", "filter", "mangle", "raw"});
+            if (chance(2)) {
+                rule.ipType = FW_IP_TYPE_BOTH;  // one family refuses the address
+            }
+        }
+    }
+    return profile;
+}
+
+FWPROFILE ProfileGenerator::exactProfile(const std::string &name) {
+    FWPROFILE profile;
+    profile.name = name;
+    for (const std::string adapter : {"eth0", "eth1", "global"}) {
+        const bool isGlobal = adapter == "global";
+        const FW_POLICY start = isGlobal ? FW_POLICY_NONE : oneOf<FW_POLICY>({FW_POLICY_ALLOW, FW_POLICY_DENY});
+        profile.adapterPolicyMap[adapter] = start;
+        std::vector<FWRULE> &rules = profile.rules[adapter];
+        for (int count = 1 + below(isGlobal ? 1 : 5); count > 0; --count) {
+            FWRULE rule;
+            rule.enable = chance(92);
+            rule.policy = oneOf<FW_POLICY>({FW_POLICY_ALLOW, FW_POLICY_DENY});
+            rule.ipType = chance(80) ? FW_IP_TYPE_V4 : FW_IP_TYPE_BOTH;
+            rule.ipGroup = FW_IP_GROUP_ANY;
+            limitPorts(rule);
+            rules.push_back(rule);
+        }
+        FWRULE some = rules.front();
+        some.ipType = FW_IP_TYPE_V4;
+        some.ipGroup = FW_IP_GROUP_NETWORK;
+        some.ipList = {"10.0.0." + std::to_string(2 + below(4)), "255.0.0.255"};  // that host behind every adapter
+        if (!isGlobal) {
+            some.policy = start == FW_POLICY_DENY ? FW_POLICY_ALLOW : FW_POLICY_DENY;
+            some.portList.clear();
+            limitPorts(some);
+        }
+        rules.insert(rules.begin(), some);
     }
     return profile;
 }
@@ -78,7 +127,8 @@ std::string ProfileGenerator::range(int first, int last) {
 }
 
 void ProfileGenerator::limitPorts(FWRULE &rule) {
-    static const std::vector<std::string> services = {"ftp", "ssh", "smtp", "dns", "smb", "no-such-service"};
+    static const std::vector<std::string> services = {
+        "ftp", "ssh", "smtp", "dns", "vpn_server_ipsec", "no-such-service"};
     switch (below(5)) {
     case 0:
         rule.portGroup = FW_PORT_GROUP_ANY;
@@ -86,7 +136,7 @@ void ProfileGenerator::limitPorts(FWRULE &rule) {
     case 1:
         rule.portGroup = chance(50) ? FW_PORT_GROUP_SERVICE : FW_PORT_GROUP_RESERVED;
         for (int count = 1 + below(3); count > 0; --count) {
-            rule.portList.push_back(services[static_cast<size_t>(below(static_cast<int>(services.size())))]);
+            rule.portList.push_back(oneOf(services));
         }
         break;
     case 2:
