@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The tool on a pseudo-terminal, and against the real kernel.
+// The tool on a pseudo-terminal, and trials against the real kernel: what was before must come back whatever happens to
+// the tool, its terminal, the disks.
 #include <gmock/gmock.h>
 #include <pty.h>
 #include <sys/wait.h>
@@ -7,6 +8,7 @@
 
 #include <csignal>
 #include <cstdlib>
+#include <optional>
 #include <thread>
 
 #include "commandRecorder.h"
@@ -32,9 +34,8 @@ public:
         if (m_process == 0) {
             setenv("TERM", "xterm", 1);
             noColor != nullptr ? setenv("NO_COLOR", noColor, 1) : unsetenv("NO_COLOR");
-            arguments.insert(arguments.begin(), VELDFWCTL);
-            std::vector<char *> words;
-            words.reserve(arguments.size() + 1);
+            std::string program = VELDFWCTL;
+            std::vector<char *> words = {program.data()};
             for (std::string &argument : arguments) {
                 words.push_back(argument.data());
             }
@@ -70,6 +71,7 @@ public:
         }
         return waitForChild(m_process);
     }
+    pid_t process() const { return m_process; }
     const std::string &output() const { return m_output; }
 
 private:
@@ -114,61 +116,93 @@ TEST_F(TerminalTest, AQuestionIsAskedAndNoChangesNothing) {
     EXPECT_TRUE(storedProfile("default")["rules"].empty());
 }
 
-TEST_F(TerminalTest, AnApplicationThatTakesLongShowsHowFarItIs) {
-    CommandRecorder recorder;
-    recorder.setDelay(80);
-    TerminalRun run({"enable"});
-    run.waitFor("commands, ");
-    EXPECT_EQ(0, run.finish());
-    EXPECT_THAT(run.output(), testing::ContainsRegex("\\[#*\\.*\\] +[0-9]+ of [0-9]+ commands"));
-}
-
-TEST_F(TerminalTest, AnApplicationGoesOnWhenTheTerminalHangsUpOrIsInterrupted) {
-    for (const bool interrupt : {false, true}) {
+TEST_F(TerminalTest, ALongApplicationShowsHowFarItIsAndGoesOnWithoutItsTerminalOrWhenInterrupted) {
+    for (const std::string event : {"none", "interrupt", "hang-up"}) {
+        SCOPED_TRACE(event);
         CommandRecorder recorder;
         recorder.setDelay(80);
-        TerminalRun run({interrupt ? "reload" : "enable"});
+        TerminalRun run({"enable"});
         run.waitFor("commands, ");
-        if (interrupt) {
+        EXPECT_THAT(run.output(), testing::ContainsRegex("\\[#*\\.*\\] +[0-9]+ of [0-9]+ commands"));
+        if (event == "interrupt") {
             run.type("\003");
-        } else {
+        } else if (event == "hang-up") {
             run.hangUp();
         }
-        run.finish();
+        const int status = run.finish();
+        EXPECT_TRUE(event != "none" || status == 0);
         // The policies of the built-in chains come last: without them the machine would stay closed.
         for (int i = 0; i < 600 && recorder.lines().back() != "/sbin/ip6tables --policy FORWARD ACCEPT"; ++i) {
             std::this_thread::sleep_for(std::chrono::milliseconds(50));
         }
         EXPECT_EQ("/sbin/ip6tables --policy FORWARD ACCEPT", recorder.lines().back());
-        EXPECT_EQ("on", parseJson(runTool({"status", "--json"}).output)["enabled"].asBool() ? "on" : "off");
+        EXPECT_TRUE(parseJson(runTool({"status", "--json"}).output)["enabled"].asBool());
     }
 }
 
-TEST_F(ToolTest, StatusCountsWhatTheKernelHoldsAndDropped) {
-    std::string reason;
-    if (!realIptables(&reason)) {
-        GTEST_SKIP() << reason;
+/// A client with a connection to a server on this machine, and a profile that cuts it off.
+class TryTest : public ToolTest {
+protected:
+    static constexpr uint16_t port = 7777;
+
+    void SetUp() override {
+        std::string reason;
+        if (!realIptables(&reason)) {
+            GTEST_SKIP() << reason;
+        }
+        ToolTest::SetUp();
+        createFirewallChains();
+        writeFile("/usr/veld/etc/firewall.d/1.json", R"({"name": "default", "adapterPolicyMap": {"eth9": 0}})");
+        writeFile("/usr/veld/etc/firewall.d/2.json", R"({"name": "closed", "adapterPolicyMap": {"eth9": 1}})");
+        addVethPair("eth9", m_client, "eth0");
+        addAddress("eth9", "10.9.0.1/24");
+        addAddress("eth0", "10.9.0.2/24", &m_client);
+        setUp("eth9");
+        setUp("eth0", &m_client);
+        m_server.emplace(std::vector<uint16_t>{port});
+        ASSERT_EQ(0, runTool({"enable"}).status);
+        m_connection.emplace(m_target, &m_client);
+        ASSERT_EQ(ProbeResult::connected, m_connection->exchange());
     }
-    EXPECT_THAT(runTool({"status"}).output, HasSubstr("missing"));
-    createFirewallChains();
-    const NetworkNamespace client("client");
-    addVethPair("eth9", client, "eth0");
-    addAddress("eth9", "10.9.0.1/24");
-    addAddress("eth0", "10.9.0.2/24", &client);
-    setUp("eth9");
-    setUp("eth0", &client);
-    ASSERT_EQ(0, runTool({"rule", "add", "-a", "eth9", "--deny", "--port", "81/tcp"}).status);
-    const ProgramResult enabled = runTool({"enable"});
-    ASSERT_EQ(0, enabled.status) << enabled.errors;
-    EXPECT_EQ(ProbeResult::timedOut, probeTcp({"10.9.0.1", 81}, &client));
-    EXPECT_EQ(ProbeResult::refused, probeTcp({"10.9.0.1", 80}, &client));
-    const Json::Value status = parseJson(runTool({"status", "--json"}).output);
-    EXPECT_TRUE(status["enabled"].asBool());
-    EXPECT_GE(status["dropped"].asUInt(), 1u);
-    const auto live = static_cast<size_t>(status["live"]["IPv4"]["INPUT_FIREWALL"]["rules"].asUInt());
-    EXPECT_EQ(listRules("/sbin/iptables", "INPUT_FIREWALL").size() - 1, live);  // "-N" is no rule
-    EXPECT_EQ(0, runTool({"disable"}).status);
-    EXPECT_EQ(0u, parseJson(runTool({"status", "--json"}).output)["live"]["IPv4"]["INPUT_FIREWALL"]["rules"].asUInt());
+
+    static Json::Value trial() { return parseJson(runTool({"try", "--status", "--json"}).output); }
+    void expectEnd() {
+        Json::Value now = trial();
+        for (int i = 0; i < 600 && now["trial"].asBool(); ++i) {
+            std::this_thread::sleep_for(std::chrono::milliseconds(50));
+            now = trial();
+        }
+        EXPECT_EQ("taken back", now["phase"].asString());
+        EXPECT_EQ(ProbeResult::connected, probeTcp(m_target, &m_client));
+        EXPECT_TRUE(storedProfile(".test_closed").isNull());
+        EXPECT_EQ(ProbeResult::connected, m_connection->exchange(std::chrono::seconds(20)));
+    }
+
+    const ProbeTarget m_target = {"10.9.0.1", port, {}};
+    NetworkNamespace m_client{"client"};
+    std::optional<EchoServer> m_server;
+    std::optional<Connection> m_connection;
+};
+
+TEST_F(TryTest, OutlivesTheToolItsTerminalAndItsGroup) {
+    for (const int number : {SIGKILL, SIGHUP}) {
+        TerminalRun run({"try", "closed", "--timeout", "3"});
+        for (int i = 0; i < 600 && !trial()["trial"].asBool(); ++i) {
+            std::this_thread::sleep_for(std::chrono::milliseconds(10));
+        }
+        ASSERT_TRUE(trial()["trial"].asBool());
+        kill(-run.process(), number);  // while the rules are being applied, or right after
+        run.hangUp();
+        run.finish();
+        expectEnd();
+    }
+}
+
+TEST_F(TryTest, OfAClientThatIsCutOffGivesItsConnectionBack) {
+    ASSERT_EQ(0, runTool({"try", "closed", "--timeout", "4", "--client", "10.9.0.2"}).status);
+    EXPECT_EQ(ProbeResult::timedOut, m_connection->exchange());
+    EXPECT_EQ(ProbeResult::timedOut, probeTcp(m_target, &m_client));
+    expectEnd();
 }
 
 }  // namespace
