@@ -4,15 +4,12 @@
 #include <veldfirewall/veldFW.h>
 
 #include <algorithm>
-#include <array>
 #include <iostream>
 #include <sstream>
 
 #include "commandRecorder.h"
 #include "files.h"
 #include "model/numbers.h"
-#include "model/restoreText.h"
-#include "model/ruleDrift.h"
 #include "network.h"
 #include "profileGenerator.h"
 #include "realIptables.h"
@@ -23,44 +20,6 @@ namespace {
 
 using testing::ElementsAre;
 using testing::HasSubstr;
-using veldfwctl::Drift;
-
-/// "-2 +3 ~1>4": a missing rule 2, a foreign rule 3, rule 4 found as rule 1.
-std::string driftText(const std::string &expected, const std::string &live) {
-    std::string text;
-    for (const Drift &drift : veldfwctl::driftFind(veldfwctl::split(expected, ' '), veldfwctl::split(live, ' '))) {
-        text += text.empty() ? "" : " ";
-        text += drift.kind == Drift::Kind::MISSING ? "-" + std::to_string(drift.expected)
-                : drift.kind == Drift::Kind::FOREIGN
-                    ? "+" + std::to_string(drift.live)
-                    : "~" + std::to_string(drift.live) + ">" + std::to_string(drift.expected);
-    }
-    return text;
-}
-
-TEST(RuleDrift, IsToldInAsFewRulesAsPossible) {
-    const std::vector<std::array<std::string, 3>> cases = {
-        {"a b c", "a b c", ""},         {"a b c", "a c", "-2"},
-        {"a b c", "a x b c", "+2"},     {"a b c d", "d a b c", "~1>4"},
-        {"a b c d", "b c d a", "~4>1"}, {"a b c", "a x c", "-2 +2"},
-        {"a a b", "a b", "-2"},         {"a b", "a b a", "+3"},
-        {"a b a c", "a b c", "-3"},     {"a b c d e", "e b x c d", "-1 ~1>5 +3"},
-    };
-    for (const auto &[expected, live, drifts] : cases) {
-        EXPECT_EQ(drifts, driftText(expected, live)) << expected << " / " << live;
-    }
-}
-
-TEST(RestoreText, QuotesWhatTheShellLessProgramWouldReadDifferently) {
-    EXPECT_EQ("*filter\n:INPUT_FIREWALL - [0:0]\n:FORWARD_FIREWALL - [0:0]\n"
-              "-A INPUT_FIREWALL ! -s 10.0.0.1 -j ACCEPT\n-A INPUT_FIREWALL -i \"a\\\"b#\" -j DROP\nCOMMIT\n"
-              "*nat\n-A X -j RETURN\nCOMMIT\n",
-              veldfwctl::restoreTextWrite({"/sbin/iptables -A INPUT_FIREWALL ! -s 10.0.0.1 -j ACCEPT",
-                                           "/sbin/iptables -t nat -A X  -j RETURN",
-                                           "/sbin/iptables -t filter -A INPUT_FIREWALL -i a\"b# -j DROP"}));
-    EXPECT_THROW(veldfwctl::restoreTextWrite({"/sbin/iptables -A X -i a\nb"}), std::runtime_error);
-    EXPECT_THROW(veldfwctl::restoreTextWrite({"/sbin/iptables -F X"}), std::runtime_error);
-}
 
 class DriftTest : public ToolTest {
 protected:
