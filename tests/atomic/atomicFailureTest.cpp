@@ -3,12 +3,14 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <functional>
 #include <thread>
+#include <tuple>
 
+#include "caseTable.h"
 #include "files.h"
 #include "kernelTest.h"
 #include "processes.h"
+#include "textEscapes.h"
 
 using namespace veldtest;
 using testing::HasSubstr;
@@ -18,15 +20,6 @@ namespace {
 void runShell(const std::string &script) {
     runChecked({"/bin/sh", "-ec", script});
 }
-
-FW::FWRULE mangleRule(const std::string &name, const std::string &address) {
-    FW::FWRULE rule = addressRule(name, address);
-    rule.table = "mangle";
-    return rule;
-}
-
-/// A match that the kernel refuses in these chains, and only at the commit.
-const std::string ownerMatch = " -m owner --uid-owner 0";
 
 class AtomicFailure : public KernelTest {
 protected:
@@ -45,14 +38,10 @@ protected:
         }
     }
 
-    struct Case {
-        const char *what;
-        std::vector<FW::FWRULE> rules;
-        FW::FwApplyFailure expected;  ///< texts that the failure holds; position and adapter exact
-    };
-
-    void expectAsBefore(const Case &test) {
-        store(profileOf(test.rules));
+    /// Tries to apply these rules.
+    /// @param expected its message is a part of what comes
+    void expectAsBefore(const std::vector<FW::FWRULE> &rules, const FW::FwApplyFailure &expected) {
+        store(profileOf(rules));
         const std::string before = allRules();
         FW::FwApplyFailure failure;
         log.clear();
@@ -60,13 +49,11 @@ protected:
         EXPECT_EQ(allRules(), before);
         EXPECT_TRUE(isSwitchedOn());
         EXPECT_TRUE(execLockIsFree());
-        EXPECT_EQ(failure.profile, "default");
-        EXPECT_EQ(failure.family, test.expected.family);
-        EXPECT_EQ(failure.adapter, test.expected.adapter);
-        EXPECT_EQ(failure.rulePosition, test.expected.rulePosition);
-        EXPECT_EQ(failure.ruleName, test.expected.ruleName);
-        EXPECT_EQ(failure.command, test.expected.command);
-        EXPECT_THAT(failure.message, HasSubstr(test.expected.message));
+        const auto whole = [](const FW::FwApplyFailure &told) {
+            return std::tie(told.profile, told.adapter, told.rulePosition, told.ruleName, told.family, told.command);
+        };
+        EXPECT_EQ(whole(failure), whole(expected));
+        EXPECT_THAT(failure.message, HasSubstr(expected.message));
         std::string logged = "the old ones stay in force: profile default";
         if (failure.rulePosition >= 0)
             logged += ": adapter " + failure.adapter + ": rule " + std::to_string(failure.rulePosition) + " \"" +
@@ -76,59 +63,37 @@ protected:
     }
 };
 
+/// A rule of cases/refusedRules.cases.
+FW::FWRULE ruleOf(const std::string &text) {
+    const size_t equals = text.find('=');
+    const bool isMangle = text.rfind("mangle ", 0) == 0;
+    FW::FWRULE rule =
+        addressRule(text.substr(isMangle ? 7 : 0, equals - (isMangle ? 7 : 0)), unescaped(text.substr(equals + 1)));
+    rule.ipType = rule.ipList[0][0] == 'f' ? FW::FW_IP_TYPE_V6 : FW::FW_IP_TYPE_V4;
+    rule.ipType = rule.name == "both" ? FW::FW_IP_TYPE_BOTH : rule.ipType;
+    rule.table = isMangle ? "mangle" : "filter";
+    return rule;
+}
+
 TEST_P(AtomicFailure, OfARuleLeavesEverythingAsItWasAndNamesIt) {
-    const FW::FWRULE good = addressRule("good", "10.0.0.1");
-    const bool nft = std::string(GetParam()) == "nft";
-    FW::FWRULE jump = addressRule("jump", "10.0.0.2 -j NEIGHBOUR");
-    jump.policy = FW::FW_POLICY_ALLOW;
-    const Case cases[] = {
-        {"refused when tried, v4",
-         {good, addressRule("bad", "10.0.0.300")},
-         {"default", "eth0", 1, "bad", "v4",
-          "/sbin/iptables -t filter -A FORWARD_FIREWALL -i eth0 -s 10.0.0.300 -j DROP",
-          "host/network `10.0.0.300' not found"}},
-        {"refused when tried, v6",
-         {good, good, addressRule("both", "10.0.0.1", FW::FW_IP_TYPE_BOTH)},
-         {"default", "eth0", 2, "both", "v6",
-          "/sbin/ip6tables -t filter -A FORWARD_FIREWALL -i eth0 -s 10.0.0.1 -j DROP",
-          "host/network `10.0.0.1' not found"}},
-        {"refused by the kernel at the commit, v6: v4 is committed before",
-         {good, addressRule("local", "fd00::7" + ownerMatch, FW::FW_IP_TYPE_V6)},
-         {"default", "eth0", 1, "local", "v6",
-          "/sbin/ip6tables -t filter -A FORWARD_FIREWALL -i eth0 -s fd00::7" + ownerMatch + " -j DROP", "failed"}},
-        {"refused by the kernel in another table: filter is committed before",
-         {good, mangleRule("local", "10.0.0.7" + ownerMatch)},
-         {"default", "eth0", 1, "local", "v4",
-          "/sbin/iptables -t mangle -A INPUT_FIREWALL -i eth0 -s 10.0.0.7" + ownerMatch + " -j DROP", "failed"}},
-        {"rules of another table are taken out again",
-         {mangleRule("mangle", "10.0.0.7"), addressRule("local", "fd00::7" + ownerMatch, FW::FW_IP_TYPE_V6),
-          mangleRule("mangle", "10.0.0.8")},
-         {"default", "eth0", 1, "local", "v6",
-          "/sbin/ip6tables -t filter -A FORWARD_FIREWALL -i eth0 -s fd00::7" + ownerMatch + " -j DROP", "failed"}},
-        {"refused by the kernel at the commit only",
-         {good, addressRule("local", "10.0.0.1" + ownerMatch), addressRule("local", "10.0.0.2")},
-         {"default", "eth0", 1, "local", "v4",
-          "/sbin/iptables -t filter -A FORWARD_FIREWALL -i eth0 -s 10.0.0.1" + ownerMatch + " -j DROP",
-          nft ? "RULE_APPEND failed (Invalid argument)" : "failed"}},
-        {"unknown target",
-         {addressRule("local", "10.0.0.1 -m comment --comment \"#x"), addressRule("aim", "10.0.0.1 -g NOWHERE")},
-         {"default", "eth0", 1, "aim", "v4",
-          "/sbin/iptables -t filter -A FORWARD_FIREWALL -i eth0 -s 10.0.0.1 -g NOWHERE -j DROP", ""}},
-        {"a string with a line break",
-         {good, addressRule("two lines", "10.0.0.1\n-A INPUT_FIREWALL -j ACCEPT")},
-         {"default", "eth0", 1, "two lines", "v4",
-          "/sbin/iptables -t filter -A FORWARD_FIREWALL -i eth0 -s 10.0.0.1\n-A INPUT_FIREWALL -j ACCEPT -j DROP",
-          "line break"}}};
-    for (const Case &test : cases) {
-        SCOPED_TRACE(test.what);
-        expectAsBefore(test);
+    for (const auto &row : readCases(VELD_CASE_DIRECTORY "refusedRules.cases", 4)) {
+        SCOPED_TRACE(row[0]);
+        std::vector<FW::FWRULE> rules;
+        for (const std::string &text : split(row[0], ';'))
+            rules.push_back(ruleOf(text.substr(text.find_first_not_of(' '))));
+        const int position = std::stoi(row[1]);
+        const FW::FWRULE &refused = rules.at(static_cast<size_t>(position));
+        const std::string family = row[2].substr(0, 2);
+        const std::string command = (family == "v4" ? "/sbin/iptables -t " : "/sbin/ip6tables -t ") + refused.table +
+                                    " -A " + row[2].substr(3) + " -i eth0 -s " + refused.ipList[0] + " -j DROP";
+        expectAsBefore(rules, {"default", "eth0", position, refused.name, family, command, row[3]});
     }
 }
 
 TEST_P(AtomicFailure, OfWhatTheSystemLacksLeavesEverythingAsItWas) {
     const auto expectFailure = [this](const std::string &family, const std::string &message) {
         SCOPED_TRACE(message);
-        expectAsBefore({"", {addressRule("new", "10.0.0.1")}, {"default", "", -1, "", family, "", message}});
+        expectAsBefore({addressRule("new", "10.0.0.1")}, {"default", "", -1, "", family, "", message});
     };
     rename("/sbin/ip6tables-restore", "/sbin/away");
     expectFailure("v6", "/sbin/ip6tables-restore: cannot be started: No such file or directory");
@@ -150,21 +115,18 @@ TEST_P(AtomicFailure, OfTheSecondFamilyPutsTheFirstBackWithItsCounters) {
     const auto v4 = [] { return runChecked({"/bin/sh", "-c", "iptables-save -c | grep -v '^#'"}); };
     const std::string before = v4();
     ASSERT_THAT(before, HasSubstr("[5:500] -A INPUT_FIREWALL"));
-    const auto failAtCommit = [](const std::string &ending) {
-        writeFile("/sbin/ip6tables-restore",
-                  "#!/bin/sh\ncase \"$*\" in *--test*) exec /sbin/ip6tables-real \"$@\";; *--counters*) exec "
-                  "/sbin/ip6tables-real \"$@\";; esac\niptables -S > /tmp/meanwhile\n" +
-                      ending,
-                  0755);
-    };
     const std::string name = std::string("/usr/sbin/ip6tables-") + GetParam() + "-restore";
     writeFile("/sbin/ip6tables-real", "#!/bin/sh\nexec " + name + " \"$@\"\n", 0755);
     for (const auto &[ending, message] :
          {std::pair("echo no luck >&2; exit 3", "no luck"), std::pair("kill -9 $$", "killed by signal 9"),
           std::pair("/sbin/ip6tables-real \"$@\"; kill -9 $$", "killed by signal 9")}) {
         SCOPED_TRACE(ending);
-        failAtCommit(ending);
-        expectAsBefore({"", {addressRule("new", "10.0.0.1")}, {"default", "", -1, "", "v6", "", message}});
+        writeFile("/sbin/ip6tables-restore",
+                  std::string("#!/bin/sh\ncase \"$*\" in *--test* | *--counters*) exec /sbin/ip6tables-real "
+                              "\"$@\";; esac\niptables -S > /tmp/meanwhile\n") +
+                      ending,
+                  0755);
+        expectAsBefore({addressRule("new", "10.0.0.1")}, {"default", "", -1, "", "v6", "", message});
         EXPECT_THAT(readFile("/tmp/meanwhile"), HasSubstr("10.0.0.1")) << "the first family was not committed before";
         EXPECT_EQ(v4(), before);
     }
