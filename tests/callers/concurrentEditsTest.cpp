@@ -1,12 +1,14 @@
 // SPDX-License-Identifier: Apache-2.0
 // Processes that edit all profiles at the same time.
-#include "files.h"
 #include "processes.h"
 #include "storedConfiguration.h"
 
 #include <gtest/gtest.h>
 #include <sys/wait.h>
 #include <veldfirewall/veldFW.h>
+
+#include <algorithm>
+#include <functional>
 
 using namespace FW;
 using namespace veldtest;
@@ -36,19 +38,20 @@ TEST(ConcurrentEdits, LeaveEveryProfileReadableAndOneOfTheTwoResults) {
         storeProfile(std::to_string(i) + ".json", {profileName(i), {{"eth0", rules}}, {{"eth0", FW_POLICY_ALLOW}}});
     }
     storeSettings(false, profileName(0));
-    const auto repeat = [](auto edit) {
-        return startChild([edit] {
-            for (int round = 0; round < rounds; ++round) {
-                if (!edit(VELDFW_PROFILE()))
-                    return 1;
-            }
-            return 0;
-        });
-    };
-    const pid_t adder =
-        repeat([](VELDFW_PROFILE p) { return p.profileAddServToReserve("global", "web", FW_POLICY_ALLOW, false); });
-    const pid_t remover = repeat([](VELDFW_PROFILE p) { return p.profileRemoveServ("web"); });
-    const pid_t editors[] = {adder, remover};
+    using Edit = std::function<bool(VELDFW_PROFILE & profiles)>;
+    const Edit edits[] = {
+        [](VELDFW_PROFILE &p) { return p.profileAddServToReserve("global", "web", FW_POLICY_ALLOW, false); },
+        [](VELDFW_PROFILE &p) { return p.profileRemoveServ("web"); }};
+    std::vector<pid_t> editors;
+    for (const Edit &edit : edits) {
+        editors.push_back(startChild([&edit] {
+            VELDFW_PROFILE profiles;
+            int done = 0;
+            while (done < rounds && edit(profiles))
+                ++done;
+            return done == rounds ? 0 : 1;
+        }));
+    }
     int seenWith = 0;
     int seenWithout = 0;
     const auto look = [&] {
@@ -61,15 +64,14 @@ TEST(ConcurrentEdits, LeaveEveryProfileReadableAndOneOfTheTwoResults) {
             ++(services.empty() ? seenWithout : seenWith);
         }
     };
-    const auto running = [&](pid_t child) {
+    const auto isRunning = [](pid_t child) {
         siginfo_t state = {};
         return waitid(P_PID, static_cast<id_t>(child), &state, WEXITED | WNOHANG | WNOWAIT) == 0 && state.si_pid == 0;
     };
-    while (!HasFatalFailure() && (running(editors[0]) || running(editors[1])))
+    while (!HasFatalFailure() && std::any_of(editors.begin(), editors.end(), isRunning))
         look();
     for (const pid_t editor : editors)
         EXPECT_EQ(waitForChild(editor), 0);
-    look();
     // Otherwise the two never met, and nothing was shown.
     EXPECT_GT(seenWith, 0);
     EXPECT_GT(seenWithout, 0);

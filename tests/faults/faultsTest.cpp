@@ -6,11 +6,10 @@
 #include <json/json.h>
 #include <sys/syscall.h>
 
+#include <array>
 #include <cstdlib>
 #include <cstring>
 #include <iostream>
-#include <set>
-#include <sstream>
 
 #include "faultRun.h"
 #include "files.h"
@@ -22,49 +21,11 @@ using namespace veldtest;
 
 namespace {
 
+const std::string STORE = "/usr/veld/etc/firewall.d/";
+
 bool isFull() {
     const char *form = std::getenv("VELD_FAULTS");
     return form != nullptr && std::string(form) == "full";
-}
-
-size_t seed() {
-    const char *text = std::getenv("VELD_SEED");
-    return text != nullptr ? std::stoul(text) : 0;
-}
-
-struct Fault {
-    FaultPoint point;
-    int error;  ///< or killProcess
-    std::string text() const {
-        return "call " + std::to_string(point.index) + ", number " + std::to_string(point.number) + ", of process " +
-               std::to_string(point.process) + (error == killProcess ? " killed" : std::string(": ") + strerror(error));
-    }
-};
-
-/// What is tried of the calls of a run without a fault.
-/// @param strideOfOwn, strideOfPrograms every how many-th fault of the process itself and of the programs that it runs
-std::vector<Fault> faultsOf(const std::function<int()> &operation, size_t strideOfOwn, size_t strideOfPrograms) {
-    std::vector<Fault> faults;
-    const FaultRun undisturbed = runWithFault(operation);
-    EXPECT_EQ(undisturbed.status, 0);
-    std::array<size_t, 2> counts = {seed(), seed()};
-    for (const FaultPoint &point : undisturbed.points) {
-        std::vector<int> errors = errorsOf(point.number);
-        errors.push_back(killProcess);
-        for (const int error : errors) {
-            const bool ofProgram = point.process != 0;
-            if (isFull() || counts.at(ofProgram ? 1 : 0)++ % (ofProgram ? strideOfPrograms : strideOfOwn) == 0)
-                faults.push_back({point, error});
-        }
-    }
-    return faults;
-}
-
-void print(const char *operation, size_t faults, const std::map<std::string, int> &outcomes) {
-    std::cout << operation << ": " << faults << (isFull() ? " faults (all)" : " faults");
-    for (const auto &[outcome, count] : outcomes)
-        std::cout << ", " << outcome << " " << count;
-    std::cout << "\n";
 }
 
 int asStatus(const std::function<bool()> &operation) {
@@ -73,6 +34,53 @@ int asStatus(const std::function<bool()> &operation) {
     } catch (const std::exception &) {
         return 1;
     }
+}
+
+/// An operation that is run once for each fault that is tried of it.
+struct Trial {
+    const char *name;
+    std::function<bool()> operation;
+    std::function<void()> start;                              ///< before each run
+    std::function<std::string(const FaultRun &run)> outcome;  ///< of a run, checked and in words
+    size_t strideOfOwn = 1;       ///< every how many-th fault of the process itself is tried
+    size_t strideOfPrograms = 1;  ///< and of the programs that it runs; 0: none
+    bool onlyKills = false;
+};
+
+/// Prints the figures. @return how often each outcome came
+std::map<std::string, int> run(const Trial &trial) {
+    const auto operation = [&trial] { return asStatus(trial.operation); };
+    trial.start();
+    const FaultRun undisturbed = runWithFault(operation);
+    EXPECT_EQ(undisturbed.status, 0);
+    const char *seed = std::getenv("VELD_SEED");
+    std::array<size_t, 2> counts = {};
+    counts.fill(seed != nullptr ? std::stoul(seed) : 0);
+    int faults = 0;
+    std::map<std::string, int> outcomes;
+    for (const FaultPoint &point : undisturbed.points) {
+        const bool isOwn = point.process == 0;
+        const size_t stride = isOwn ? trial.strideOfOwn : trial.strideOfPrograms;
+        std::vector<int> errors = trial.onlyKills ? std::vector<int>() : errorsOf(point.number);
+        errors.push_back(killProcess);
+        for (const int error : errors) {
+            if (stride == 0 || (counts.at(isOwn ? 0 : 1)++ % stride != 0 && !isFull()) ||
+                testing::Test::HasFatalFailure())
+                continue;
+            SCOPED_TRACE("call " + std::to_string(point.index) + ", number " + std::to_string(point.number) +
+                         ", of process " + std::to_string(point.process) +
+                         (error == killProcess ? " killed" : std::string(": ") + strerror(error)));
+            trial.start();
+            ++outcomes[trial.outcome(runWithFault(operation, point, error))];
+            ++faults;
+        }
+    }
+    std::cout << trial.name << ": " << faults << (isFull() ? " faults (all)" : " faults");
+    for (const auto &[outcome, count] : outcomes)
+        std::cout << ", " << outcome << " " << count;
+    std::cout << "\n";
+    EXPECT_GE(faults, 15);
+    return outcomes;
 }
 
 #define SKIP_UNLESS_TRACEABLE()                                                                                        \
@@ -86,87 +94,61 @@ class StoreFaults : public FirewallTest {};
 
 TEST_F(StoreFaults, LeaveTheOldOrTheNewDocumentAfterADump) {
     SKIP_UNLESS_TRACEABLE();
-    const std::string path = "/usr/veld/etc/firewall.d/7.json";
-    const auto document = [](const char *name) {
+    const auto dump = [](const char *name) {
         Json::Value value;
         value["name"] = name;
         for (int i = 0; i < 2000; ++i)  // several pages
             value["filling"].append(i);
-        return value;
+        return FW::jsonFileDump(value, STORE + "7.json");
     };
-    const auto stored = [&] {
+    const auto outcome = [](const FaultRun &run) {
         Json::Value value;
-        EXPECT_TRUE(FW::jsonFileLoad(value, path));
+        EXPECT_TRUE(FW::jsonFileLoad(value, STORE + "7.json"));
         EXPECT_EQ(value["filling"].size(), 2000u);
-        return value["name"].asString();
-    };
-    const auto dump = [&] { return asStatus([&] { return FW::jsonFileDump(document("new"), path); }); };
-    ASSERT_TRUE(FW::jsonFileDump(document("old"), path));
-    std::map<std::string, int> outcomes;
-    const std::vector<Fault> faults = faultsOf(dump, 1, 1);
-    for (const Fault &fault : faults) {
-        SCOPED_TRACE(fault.text());
-        ASSERT_TRUE(FW::jsonFileDump(document("old"), path));
-        const FaultRun run = runWithFault(dump, fault.point, fault.error);
-        const std::string name = stored();
+        const std::string name = value["name"].asString();
         EXPECT_TRUE(name == "new" || (name == "old" && run.status != 0)) << name << " after " << run.status;
-        outcomes[(run.status == 0 ? "succeeded" : "failed") + std::string(" and ") + name] += 1;
-    }
-    ASSERT_TRUE(FW::jsonFileDump(document("next"), path));
-    EXPECT_EQ(stored(), "next");
-    print("dump", faults.size(), outcomes);
-    EXPECT_GT(faults.size(), 20u);
+        return (run.status == 0 ? "succeeded and " : "failed and ") + name;
+    };
+    run({"dump", [&] { return dump("new"); }, [&] { ASSERT_TRUE(dump("old")); }, outcome});
 }
 
 TEST_F(StoreFaults, LeaveTheOldOrTheNewProfileAfterAnEdit) {
     SKIP_UNLESS_TRACEABLE();
-    const auto profile = [](const std::string &port) {
-        FW::FWPROFILE made = profileOf({portRule(port, FW::FW_POLICY_DENY)});
-        return made;
-    };
-    const auto stored = [] {
-        FW::FWPROFILE found;
-        EXPECT_TRUE(FW::VELDFW_PROFILE().profileGet("default", found));
-        return found.rules["eth0"].at(0).portList.at(0);
-    };
-    const auto edit = [&] {
-        return asStatus([&] { return FW::VELDFW_PROFILE().profileSet("default", profile("2")); });
+    const auto edit = [](const char *port) {
+        return FW::VELDFW_PROFILE().profileSet("default", profileOf({portRule(port, FW::FW_POLICY_DENY)}));
     };
     const auto start = [&] {
-        removeAll("/usr/veld/etc/firewall.d");
+        removeAll(STORE);
         writeFile(PROFILE, R"({"name": "default"})");
-        return FW::VELDFW_PROFILE().profileSet("default", profile("1"));
+        ASSERT_TRUE(edit("1"));
     };
-    ASSERT_TRUE(start());
-    std::map<std::string, int> outcomes;
-    const std::vector<Fault> faults = faultsOf(edit, 1, 1);
-    for (const Fault &fault : faults) {
-        SCOPED_TRACE(fault.text());
-        ASSERT_TRUE(start());
-        const FaultRun run = runWithFault(edit, fault.point, fault.error);
-        const std::string port = stored();
+    const auto outcome = [&](const FaultRun &run) -> std::string {
+        FW::FWPROFILE found;
+        EXPECT_TRUE(FW::VELDFW_PROFILE().profileGet("default", found));
+        const bool isNew = found.rules["eth0"].at(0).portList.at(0) == "2";
         // A profile whose document cannot be read while names are looked up does not exist: then a second document is
         // made, and the first goes on to count.
-        const bool isBeside = run.status == 0 && listDirectory("/usr/veld/etc/firewall.d").size() == 2;
-        EXPECT_TRUE(port == "2" || (port == "1" && (run.status != 0 || isBeside))) << port << " after " << run.status;
-        outcomes[isBeside          ? "written beside the document that could not be read"
-                 : run.status == 0 ? "succeeded and new"
-                 : port == "1"     ? "failed and old"
-                                   : "failed and new"] += 1;
-        EXPECT_EQ(edit(), 0);
-    }
-    print("edit", faults.size(), outcomes);
-    EXPECT_GT(faults.size(), 20u);
+        const bool isBeside = run.status == 0 && listDirectory(STORE).size() == 2;
+        EXPECT_TRUE(isNew || run.status != 0 || isBeside) << run.status;
+        EXPECT_TRUE(edit("2"));
+        return isBeside          ? "written beside the document that could not be read"
+               : run.status == 0 ? "succeeded and new"
+               : isNew           ? "failed and new"
+                                 : "failed and old";
+    };
+    run({"edit", [&] { return edit("2"); }, start, outcome});
 }
 
 class ReloadFaults : public KernelTest {
 protected:
+    using Rules = std::pair<std::string, std::string>;
+
     void SetUp() override {
         KernelTest::SetUp();
-        writeFile("/usr/veld/etc/firewall.d/2.json", R"({"name": "other"})");
-        FW::FWPROFILE profile = profileOf({addressRule("", "10.0.0.1"), addressRule("", "fd00::1", FW::FW_IP_TYPE_V6)});
-        store(profile);
-        profile = profileOf({portRule("80", FW::FW_POLICY_ALLOW), addressRule("", "fd00::2", FW::FW_IP_TYPE_V6)});
+        writeFile(STORE + "2.json", R"({"name": "other"})");
+        store(profileOf({addressRule("", "10.0.0.1"), addressRule("", "fd00::1", FW::FW_IP_TYPE_V6)}));
+        FW::FWPROFILE profile =
+            profileOf({portRule("80", FW::FW_POLICY_ALLOW), addressRule("", "fd00::2", FW::FW_IP_TYPE_V6)});
         profile.name = "other";
         ASSERT_TRUE(FW::VELDFW_PROFILE().profileSet("other", profile));
     }
@@ -175,82 +157,70 @@ protected:
         writeFile(SETTINGS, "{\"profile\": \"" + name + "\", \"status\": true}");
     }
 
-    static std::pair<std::string, std::string> rules() {
-        return {runChecked({"/sbin/iptables", "-S"}), runChecked({"/sbin/ip6tables", "-S"})};
-    }
+    /// All rules of each family.
+    static Rules rules() { return {runChecked({"/sbin/iptables", "-S"}), runChecked({"/sbin/ip6tables", "-S"})}; }
 
-    /// Every document is whole, and the firewall switched on.
-    static void expectDocuments(const std::string &active) {
-        EXPECT_EQ(listDirectory("/usr/veld/etc/firewall.d"),
-                  (std::vector<std::string>{"1.json", "2.json", "firewall_settings.json"}));
+    /// No lock is left, both profiles can be read, and the firewall is switched on with that profile.
+    static void expectOrder(const std::string &active) {
+        EXPECT_TRUE(execLockIsFree());
+        EXPECT_EQ(listDirectory(STORE), (std::vector<std::string>{"1.json", "2.json", "firewall_settings.json"}));
         Json::Value settings;
         EXPECT_TRUE(FW::jsonFileLoad(settings, SETTINGS));
         EXPECT_EQ(settings["profile"].asString(), active);
         EXPECT_TRUE(settings["status"].asBool());
-        FW::FWPROFILE profile;
-        for (const char *name : {"default", "other"})
-            EXPECT_TRUE(FW::VELDFW_PROFILE().profileGet(name, profile));
+        std::map<std::string, FW::FWPROFILE> profiles;
+        EXPECT_TRUE(FW::VELDFW_PROFILE().profileEnum(profiles) && profiles.size() == 2);
     }
 };
 
 TEST_P(ReloadFaults, LeaveTheOldOrTheNewRulesAfterAnAtomicReload) {
     SKIP_UNLESS_TRACEABLE();
-    const auto reload = [this] { return asStatus([this] { return firewall.fwReloadAtomic(true); }); };
+    const auto reload = [this] { return firewall.fwReloadAtomic(true); };
     const auto applied = [&](const char *name) {
         activate(name);
-        EXPECT_EQ(reload(), 0) << log.text();
+        EXPECT_TRUE(reload()) << log.text();
         return rules();
     };
-    const auto newRules = applied("other");
-    const auto oldRules = applied("default");
-    activate("other");
-    const std::vector<Fault> faults = faultsOf(reload, 7, 43);
-    std::map<std::string, int> outcomes;
-    for (const Fault &fault : faults) {
-        SCOPED_TRACE(fault.text());
+    const Rules newRules = applied("other");
+    const Rules oldRules = applied("default");
+    const auto start = [&] {
         ASSERT_EQ(applied("default"), oldRules) << "the next reload: " << log.text();
         log.clear();
         activate("other");
-        const FaultRun run = runWithFault(reload, fault.point, fault.error);
-        const auto left = rules();
-        if (run.status == 0) {
-            EXPECT_TRUE(left == newRules) << log.text();
-        } else if (run.status == 1) {
-            EXPECT_TRUE(left == oldRules) << log.text();
-        } else {
+    };
+    const auto outcome = [&](const FaultRun &run) -> std::string {
+        const Rules left = rules();
+        const bool isKilled = run.status > 1;
+        if (isKilled) {
             EXPECT_TRUE(left.first == oldRules.first || left.first == newRules.first) << left.first;
             EXPECT_TRUE(left.second == oldRules.second || left.second == newRules.second) << left.second;
+        } else {
+            EXPECT_EQ(left, run.status == 0 ? newRules : oldRules) << log.text();
         }
-        EXPECT_TRUE(execLockIsFree());
-        expectDocuments("other");
-        outcomes[run.status == 0 ? "succeeded" : run.status == 1 ? "failed" : "killed"] += 1;
-    }
-    print("atomic reload", faults.size(), outcomes);
-    EXPECT_GT(faults.size(), 50u);
+        expectOrder("other");
+        return isKilled ? "killed" : run.status == 0 ? "succeeded" : "failed";
+    };
+    run({"atomic reload", reload, start, outcome, 7, 43});
 }
 
 TEST_P(ReloadFaults, ArePutRightByTheNextReloadWhenTheSpecifiedOneIsKilled) {
     SKIP_UNLESS_TRACEABLE();
-    const auto reload = [this] { return asStatus([this] { return firewall.fwReload(true); }); };
+    const auto reload = [this] { return firewall.fwReload(true); };
     activate("default");
-    ASSERT_EQ(reload(), 0) << log.text();
-    const auto expected = rules();
-    std::vector<Fault> faults = faultsOf(reload, 53, 1000000);
-    std::map<std::string, int> outcomes;
-    for (const Fault &fault : faults) {
-        if (fault.point.process != 0)
-            continue;
-        SCOPED_TRACE(fault.text());
-        const FaultRun run = runWithFault(reload, fault.point, killProcess);
-        EXPECT_EQ(run.status, run.wasStruck ? 128 + SIGKILL : 0);
-        outcomes[rules() == expected ? "killed with all rules" : "killed half-way"] += 1;
-        EXPECT_TRUE(execLockIsFree());
-        expectDocuments("default");
-        ASSERT_EQ(reload(), 0) << log.text();
+    ASSERT_TRUE(reload()) << log.text();
+    const Rules expected = rules();
+    const auto start = [&] {
+        ASSERT_TRUE(reload()) << log.text();
         ASSERT_EQ(rules(), expected);
-    }
-    print("specified reload", faults.size(), outcomes);
+    };
+    const auto outcome = [&](const FaultRun &run) -> std::string {
+        EXPECT_EQ(run.status, run.wasStruck ? 128 + SIGKILL : 0);
+        expectOrder("default");
+        return rules() == expected ? "killed with all rules" : "killed half-way";
+    };
+    auto outcomes = run({"specified reload", reload, start, outcome, 20, 0, true});
     EXPECT_GT(outcomes["killed half-way"], 0);
+    start();
 }
 
 INSTANTIATE_TEST_SUITE_P(Backend, ReloadFaults, testing::Values("nft", "legacy"),

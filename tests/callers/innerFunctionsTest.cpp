@@ -1,10 +1,14 @@
 // SPDX-License-Identifier: Apache-2.0
-// The evaluation of block queries: the state table row by row, port matches, the order of lists, the merge.
-#include "fw/blockQuery.h"
+// The inner functions behind block queries (the state table row by row, port matches, the order of lists, the merge)
+// and behind edits of rule lists, as tables.
 #include "caseTable.h"
+#include "fw/blockQuery.h"
+#include "fw/ruleListEdit.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <json/value.h>
+#include <veldfirewall/fwDB.h>
 
 using namespace FW;
 using namespace veldtest;
@@ -59,19 +63,11 @@ TEST(PortMatch, IsStrictForAllowAndLooseForDeny) {
 }
 
 TEST(RuleMatch, FollowsThePortGroup) {
-    FWRULE rule = portRule(1, "80");
-    EXPECT_TRUE(ruleMatches(rule, tcp80, noServices));
-    rule.enable = false;
-    EXPECT_FALSE(ruleMatches(rule, tcp80, noServices));
-    rule.portGroup = FW_PORT_GROUP_ANY;
-    EXPECT_FALSE(ruleMatches(rule, tcp80, noServices));
-    rule.enable = true;
-    EXPECT_TRUE(ruleMatches(rule, {1, FW_PROTO_IGMP, ""}, noServices));
-    rule.portGroup = 4;
-    EXPECT_FALSE(ruleMatches(rule, tcp80, noServices));
-}
-
-TEST(RuleMatch, ServicesCountBySideAndTheRulesOwnDirectionAndProtocolDoNot) {
+    const std::map<std::string, int> groups = {{"port", FW_PORT_GROUP_PORT},
+                                               {"any", FW_PORT_GROUP_ANY},
+                                               {"service", FW_PORT_GROUP_SERVICE},
+                                               {"reserved", FW_PORT_GROUP_RESERVED},
+                                               {"9", 9}};
     const auto expand = [](const std::vector<std::string> &names, ServPort &ports) {
         EXPECT_EQ(names, (std::vector<std::string>{"web", "mail"}));
         ports.srcPorts[FW_PROTO_UDP] = {"500"};
@@ -79,19 +75,19 @@ TEST(RuleMatch, ServicesCountBySideAndTheRulesOwnDirectionAndProtocolDoNot) {
         ports.dstPorts[FW_PROTO_TCP_UDP] = {"53"};
         return true;
     };
-    const std::pair<PortCompareST, bool> cases[] = {
-        {{0, FW_PROTO_TCP, "80"}, true},  {{0, FW_PROTO_UDP, "25"}, false},  {{0, FW_PROTO_UDP, "53"}, true},
-        {{1, FW_PROTO_UDP, "500"}, true}, {{0, FW_PROTO_UDP, "500"}, false}, {{1, FW_PROTO_TCP, "80"}, false},
-        {{2, FW_PROTO_TCP, "80"}, false},
-    };
-    for (const int group : {FW_PORT_GROUP_SERVICE, FW_PORT_GROUP_RESERVED}) {
-        FWRULE rule;
-        rule.portGroup = group;
-        rule.portDirect = 1;
-        rule.protocol = FW_PROTO_IGMP;
-        rule.portList = {"web", "mail"};
-        for (const auto &[query, matches] : cases)
-            EXPECT_EQ(ruleMatches(rule, query, expand), matches) << query.portDirect << " " << query.port;
+    for (const auto &row : readCases(caseDirectory + "ruleMatches.cases", 3)) {
+        FWRULE rule = portRule(1, "80");
+        rule.portGroup = groups.at(split(row[0], ' ')[0]);
+        rule.enable = split(row[0], ' ').size() == 1;
+        if (rule.portGroup == FW_PORT_GROUP_SERVICE || rule.portGroup == FW_PORT_GROUP_RESERVED) {
+            rule.portDirect = 1;
+            rule.protocol = FW_PROTO_IGMP;
+            rule.portList = {"web", "mail"};
+        }
+        const auto query = split(row[1], ' ');
+        const PortCompareST compared = {std::stoi(query[0]), static_cast<FW_PORT_PROTOCOL>(std::stoi(query[1])),
+                                        query[2]};
+        EXPECT_EQ(ruleMatches(rule, compared, expand), row[2] == "yes") << testing::PrintToString(row);
     }
 }
 
@@ -142,6 +138,56 @@ TEST(Merge, TheSeverestVerdictStays) {
             EXPECT_EQ(result["eth0"], policyOf(rank[second] > rank[first] ? second : first)) << first << second;
             EXPECT_EQ(result["eth1"], policyOf(second));
         }
+    }
+}
+
+// The short form of cases/edits.cases: "R0:ssh,smb S1:ftp R1-:ssh".
+std::vector<FWRULE> rulesOf(const std::string &text) {
+    std::vector<FWRULE> rules;
+    for (const std::string &word : split(text, ' ')) {
+        const char kind = word[0];
+        FWRULE &rule = rules.emplace_back();
+        rule.portGroup = kind == 'S'   ? FW_PORT_GROUP_SERVICE
+                         : kind == 'P' ? FW_PORT_GROUP_PORT
+                                       : FW_PORT_GROUP_RESERVED;
+        rule.ipGroup = kind == 'r' ? FW_IP_GROUP_ADDRESS : FW_IP_GROUP_ANY;
+        rule.policy = policyOf(word[1] - '0');
+        rule.enable = word[2] != '-';
+        rule.portList = split(word.substr(word.find(':') + 1), ',');
+        if (kind == 'R') {  // as reserving makes it
+            rule.name = "Service";
+            rule.ipType = FW_IP_TYPE_BOTH;
+            rule.protocol = FW_PROTO_TCP_UDP;
+        }
+    }
+    return rules;
+}
+
+Json::Value jsonOf(const FWPROFILE &profile) {
+    Json::Value json;
+    VELDFW_JSON_DB().profileToJson(profile, json);
+    return json;
+}
+
+FWPROFILE profileOf(const std::string &policies, const std::string &lists) {
+    FWPROFILE profile = {"p", {}, policiesOf(policies)};
+    for (const std::string &list : split(lists, ';'))
+        profile.rules[split(list, '=')[0]] = rulesOf(list.substr(list.find('=') + 1));
+    return profile;
+}
+
+TEST(RuleListEdit, LeavesWhatTheTableSays) {
+    for (const auto &row : readCases(caseDirectory + "edits.cases", 5)) {
+        SCOPED_TRACE(row[0] + ": " + row[1] + ", " + row[2]);
+        const auto edit = split(row[0], ' ');
+        FWPROFILE profile = profileOf(row[1], row[2]);
+        if (edit[0] == "reserve")
+            serviceReserve(profile, "eth0", "ssh", policyOf(std::stoi(edit[1])));
+        else if (edit[0] == "remove")
+            serviceRemove(profile, "ssh");
+        else
+            EXPECT_EQ(adapterRename(profile, "eth0", edit[1]), edit[2] == "yes");
+        EXPECT_EQ(jsonOf(profile), jsonOf(profileOf(row[3], row[4])));
     }
 }
 
