@@ -30,8 +30,8 @@ test: ## install what is needed, build, and run all tests
 
 soak: ## reloads, edits, queries, a neighbour and a held lock at once, for SOAK_SECONDS (240)
 	scripts/install-dependencies.sh test
-	$(call build,dev,,--target veld_soak)
-	build-dev/tests/soak/veld_soak --seconds=$(SOAK_SECONDS)
+	$(call build,dev,,--target soak_test)
+	VELD_SOAK_SECONDS=$(SOAK_SECONDS) ctest --preset dev --parallel 2 --tests-regex '^soak_test' --verbose
 
 bench: ## measure; prints a table, writes out/bench.json (BENCH_ARGS=--smoke: only a quick run)
 	scripts/install-dependencies.sh bench
