@@ -8,6 +8,7 @@
 #include <memory>
 
 #include "connections.h"
+#include "files.h"
 #include "model/packetQuery.h"
 #include "model/packetWalk.h"
 #include "network.h"
@@ -183,6 +184,20 @@ TEST_F(PacketsOnKernel, GoAsExplainAndBlockQueriesSayForGeneratedProfiles) {
     for (const FW::FW_POLICY policy : {FW::FW_POLICY_ALLOW, FW::FW_POLICY_DENY, FW::FW_POLICY_PARTIAL}) {
         EXPECT_GE(m_verdicts[policy], 40) << policy;
     }
+}
+
+TEST_F(PacketsOnKernel, OfAClientThatATrialCutsOffGetThroughAgainAtItsEnd) {
+    const ProbeTarget target = {hostAddress("eth0", 1, false), 21, hostAddress("eth0", FIRST_HOST, false)};
+    writeFile("/usr/veld/etc/firewall.d/1.json", R"({"name": "default", "adapterPolicyMap": {"eth0": 0}})");
+    writeFile("/usr/veld/etc/firewall.d/2.json", R"({"name": "closed", "adapterPolicyMap": {"eth0": 1}})");
+    ASSERT_TRUE(FW::VELDFW().fwReload(true));
+    Connection connection(target, &m_client);
+    ASSERT_EQ(ProbeResult::connected, connection.exchange());
+    ASSERT_EQ(0, runTool({"try", "closed", "--timeout", "4", "--client", target.source}).status);
+    EXPECT_EQ(ProbeResult::timedOut, connection.exchange());
+    EXPECT_EQ(ProbeResult::timedOut, probeTcp(target, &m_client));
+    EXPECT_EQ(ProbeResult::connected, connection.exchange(std::chrono::seconds(60)));
+    EXPECT_EQ(ProbeResult::connected, probeTcp(target, &m_client));
 }
 
 }  // namespace

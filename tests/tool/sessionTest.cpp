@@ -10,6 +10,7 @@
 //   ~ PROFILE.ADAPTER {}   members that the last rule of that list has in the store; "none" for an empty list
 //   + command              an iptables command that was run, in this order among others
 //   % fail PART :: TEXT    from now on a command that holds PART fails, and prints TEXT
+//   % delay MILLISECONDS   each command of the next run lasts that long
 //   % kernel               from now on the machine's own iptables are run, on the sandbox's network
 //   % need PROGRAM         skips the rest where the machine does not have it
 //   % write PATH TEXT      writes a file
@@ -170,6 +171,8 @@ private:
             m_recorder->failMatching(m_failures.back().first, 2, m_failures.back().second);
         } else if (verb == "write") {
             writeFile(rest.substr(0, rest.find(' ')), rest.substr(rest.find(' ') + 1));
+        } else if (verb == "delay") {
+            m_recorder->setDelay(static_cast<unsigned>(std::stoul(rest)));
         } else if (verb == "remove") {
             removeAll(rest);
         } else if (verb == "kernel") {
