@@ -1,18 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
-// Trials of a profile: the test copy, the commands, and what connections feel of it on the real kernel.
+// Trials of a profile: the test copy and the commands.
 #include "commandRecorder.h"
-#include "connections.h"
 #include "files.h"
-#include "network.h"
-#include "realIptables.h"
 #include "storedConfiguration.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <veldfirewall/veldFW.h>
 #include <veldfirewall/veldIptablesModule.h>
-
-#include <memory>
 
 using namespace FW;
 using namespace veldtest;
@@ -137,79 +132,6 @@ TEST_F(TrialCommands, AFailureNeverLeavesTheMachineLockedOut) {
         EXPECT_EQ(storedStatus(), failure.statusAfter);
         EXPECT_EQ(lastError(log), "veldFW.cpp " + failure.error);
     }
-}
-
-/// Two hosts behind one interface, each with a connection to port 80 that the active profile lets through.
-class TrialOnTheKernel : public testing::Test {
-protected:
-    static constexpr const char *tester = "10.1.0.2";
-    static constexpr const char *otherHost = "10.1.0.3";
-    static constexpr std::chrono::seconds untilSentAgain{20};  // TCP waits longer after each lost packet
-
-    void SetUp() override {
-        std::string reason;
-        if (!realIptables(&reason))
-            GTEST_SKIP() << "iptables does not work here: " << reason;
-        installPlatformData();
-        createFirewallChains();
-        addVethPair("eth0", m_client, "client0");
-        addAddress("eth0", "10.1.0.1/24");
-        addAddress("client0", std::string(tester) + "/24", &m_client);
-        addAddress("client0", std::string(otherHost) + "/24", &m_client);
-        setUp("eth0");
-        setUp("client0", &m_client);
-        storeProfile("1.json", {"home", {}, {{"eth0", FW_POLICY_ALLOW}}});
-        storeSettings(false, "home");
-        ASSERT_TRUE(VELDFW().fwEnable());
-        m_server = std::make_unique<EchoServer>(std::vector<uint16_t>{80});
-        m_testers = std::make_unique<Connection>(target(tester), &m_client);
-        m_others = std::make_unique<Connection>(target(otherHost), &m_client);
-        ASSERT_EQ(m_testers->exchange(), ProbeResult::connected);
-        ASSERT_EQ(m_others->exchange(), ProbeResult::connected);
-    }
-    static ProbeTarget target(const std::string &source) { return {"10.1.0.1", 80, source}; }
-    /// Stores and applies a profile for eth0 whose default is to deny.
-    static void tryProfile(const std::vector<FWRULE> &rules, const std::string &client) {
-        ASSERT_TRUE(
-            VELDFW_PROFILE().CreateTestProfile("home", {"home", {{"eth0", rules}}, {{"eth0", FW_POLICY_DENY}}}));
-        ASSERT_TRUE(VELDFW().TestApplyingProfile("home", client));
-    }
-    void expectNewConnections(ProbeResult testers, ProbeResult others) {
-        EXPECT_EQ(probeTcp(target(tester), &m_client), testers);
-        EXPECT_EQ(probeTcp(target(otherHost), &m_client), others);
-    }
-
-    NetworkNamespace m_client{"client"};
-    std::unique_ptr<EchoServer> m_server;
-    std::unique_ptr<Connection> m_testers;
-    std::unique_ptr<Connection> m_others;
-};
-
-TEST_F(TrialOnTheKernel, OfAClientCutsOffItsConnectionOnlyAndEndsWithTheNextReload) {
-    tryProfile({}, tester);
-    EXPECT_EQ(m_testers->exchange(), ProbeResult::timedOut);
-    EXPECT_EQ(m_others->exchange(untilSentAgain), ProbeResult::connected);
-    expectNewConnections(ProbeResult::timedOut, ProbeResult::timedOut);
-    ASSERT_TRUE(VELDFW_PROFILE().RemoveTestProfile("home"));
-    ASSERT_TRUE(VELDFW().fwReload(true));
-    EXPECT_TRUE(storedStatus());
-    expectNewConnections(ProbeResult::connected, ProbeResult::connected);
-    EXPECT_EQ(m_testers->exchange(untilSentAgain), ProbeResult::connected);
-    EXPECT_EQ(m_others->exchange(untilSentAgain), ProbeResult::connected);
-}
-
-TEST_F(TrialOnTheKernel, LetsTheClientsConnectionLiveWhenTheProfileDoesAndWithoutAClientNobodys) {
-    tryProfile({portRule(FW_POLICY_ALLOW, "80", tester)}, tester);
-    EXPECT_EQ(m_testers->exchange(untilSentAgain), ProbeResult::connected);
-    EXPECT_EQ(m_others->exchange(untilSentAgain), ProbeResult::connected);
-    expectNewConnections(ProbeResult::connected, ProbeResult::timedOut);
-    ASSERT_TRUE(VELDFW().fwDisable());
-    tryProfile({}, "");
-    EXPECT_FALSE(storedStatus());
-    EXPECT_EQ(m_testers->exchange(), ProbeResult::timedOut);
-    EXPECT_EQ(m_others->exchange(), ProbeResult::timedOut);
-    ASSERT_TRUE(VELDFW().fwEnable());
-    expectNewConnections(ProbeResult::connected, ProbeResult::connected);
 }
 
 }  // namespace

@@ -51,63 +51,51 @@ void resultSet(pid_t process, long result) {
 }
 
 const std::map<uint64_t, std::vector<int>> &errorTable() {
-    static const std::map<uint64_t, std::vector<int>> table = [] {
-        std::map<uint64_t, std::vector<int>> errors = {
-            {SYS_openat, {EMFILE, EACCES, EIO}},
-            {SYS_read, {EIO, EINTR}},
-            {SYS_pread64, {EIO}},
-            {SYS_write, {ENOSPC, EIO, EINTR}},
-            {SYS_close, {EIO}},
-            {SYS_lseek, {EINVAL}},
-            {SYS_fsync, {EIO, ENOSPC}},
-            {SYS_fchmod, {EPERM, EROFS}},
-            {SYS_ftruncate, {EIO}},
-            {SYS_newfstatat, {EACCES}},
-            {SYS_fstat, {EIO}},
-            {SYS_getdents64, {EIO}},
-            {SYS_fcntl, {EINTR, ENOLCK}},
-            {SYS_flock, {EINTR}},
-            {SYS_mmap, {ENOMEM}},
-            {SYS_mprotect, {ENOMEM}},
-            {SYS_memfd_create, {EMFILE, ENOMEM}},
-            {SYS_dup3, {EMFILE}},
-            {SYS_pipe2, {EMFILE}},
-            {SYS_clone, {EAGAIN, ENOMEM}},
-            {SYS_clone3, {EAGAIN, ENOMEM}},
-            {SYS_execve, {ENOENT, EACCES, ENOMEM}},
-            {SYS_wait4, {EINTR}},
-            {SYS_socket, {EMFILE, EACCES}},
-            {SYS_bind, {ENOMEM}},
-            {SYS_connect, {ECONNREFUSED}},
-            {SYS_sendto, {ENOBUFS}},
-            {SYS_sendmsg, {ENOBUFS, EPERM}},
-            {SYS_recvmsg, {ENOBUFS}},
-            {SYS_recvfrom, {ENOBUFS}},
-            {SYS_setsockopt, {EPERM}},
-            {SYS_getsockopt, {EPERM}},
-            {SYS_ioctl, {EIO}},
-            {SYS_unlinkat, {EIO}},
-            {SYS_renameat2, {EIO, ENOSPC}},
-            {SYS_mkdirat, {ENOSPC}},
-            {SYS_faccessat, {EACCES}},
-        };
-#ifdef SYS_open
-        for (const auto &[number, other] : {std::pair(SYS_open, SYS_openat),
-                                            {SYS_stat, SYS_newfstatat},
-                                            {SYS_lstat, SYS_newfstatat},
-                                            {SYS_rename, SYS_renameat2},
-                                            {SYS_unlink, SYS_unlinkat},
-                                            {SYS_mkdir, SYS_mkdirat},
-                                            {SYS_access, SYS_faccessat},
-                                            {SYS_dup2, SYS_dup3},
-                                            {SYS_pipe, SYS_pipe2},
-                                            {SYS_vfork, SYS_clone},
-                                            {SYS_fork, SYS_clone}})
-            errors[static_cast<uint64_t>(number)] = errors.at(static_cast<uint64_t>(other));
+    struct Group {
+        std::vector<int> errors;
+        std::vector<long> numbers;
+    };
+    static const std::vector<Group> groups = {
+        {{EMFILE, EACCES, EIO}, {SYS_openat}},
+        {{EIO, EINTR}, {SYS_read}},
+        {{ENOSPC, EIO, EINTR}, {SYS_write}},
+        {{EIO}, {SYS_pread64, SYS_close, SYS_ftruncate, SYS_fstat, SYS_getdents64, SYS_ioctl, SYS_unlinkat}},
+        {{EIO, ENOSPC}, {SYS_fsync, SYS_renameat2}},
+        {{EINVAL}, {SYS_lseek}},
+        {{EPERM, EROFS}, {SYS_fchmod}},
+        {{EACCES}, {SYS_newfstatat, SYS_faccessat}},
+        {{EINTR, ENOLCK}, {SYS_fcntl}},
+        {{EINTR}, {SYS_flock, SYS_wait4}},
+        {{ENOMEM}, {SYS_mmap, SYS_mprotect, SYS_bind}},
+        {{EMFILE, ENOMEM}, {SYS_memfd_create}},
+        {{EMFILE}, {SYS_dup3, SYS_pipe2}},
+        {{EAGAIN, ENOMEM}, {SYS_clone, SYS_clone3}},
+        {{ENOENT, EACCES, ENOMEM}, {SYS_execve}},
+        {{EMFILE, EACCES}, {SYS_socket}},
+        {{ECONNREFUSED}, {SYS_connect}},
+        {{ENOBUFS, EPERM}, {SYS_sendmsg}},
+        {{ENOBUFS}, {SYS_sendto, SYS_recvmsg, SYS_recvfrom}},
+        {{EPERM}, {SYS_setsockopt, SYS_getsockopt}},
+        {{ENOSPC}, {SYS_mkdirat}},
+#ifdef SYS_open  // calls that newer machines do not have
+        {{EMFILE, EACCES, EIO}, {SYS_open}},
+        {{EACCES}, {SYS_stat, SYS_lstat, SYS_access}},
+        {{EIO, ENOSPC}, {SYS_rename}},
+        {{EIO}, {SYS_unlink}},
+        {{ENOSPC}, {SYS_mkdir}},
+        {{EMFILE}, {SYS_dup2, SYS_pipe}},
+        {{EAGAIN, ENOMEM}, {SYS_vfork, SYS_fork}},
 #endif
 #ifdef SYS_renameat
-        errors[SYS_renameat] = errors.at(SYS_renameat2);
+        {{EIO, ENOSPC}, {SYS_renameat}},
 #endif
+    };
+    static const std::map<uint64_t, std::vector<int>> table = [] {
+        std::map<uint64_t, std::vector<int>> errors;
+        for (const Group &group : groups) {
+            for (const long number : group.numbers)
+                errors[static_cast<uint64_t>(number)] = group.errors;
+        }
         return errors;
     }();
     return table;

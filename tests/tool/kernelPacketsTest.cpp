@@ -186,18 +186,79 @@ TEST_F(PacketsOnKernel, GoAsExplainAndBlockQueriesSayForGeneratedProfiles) {
     }
 }
 
-TEST_F(PacketsOnKernel, OfAClientThatATrialCutsOffGetThroughAgainAtItsEnd) {
-    const ProbeTarget target = {hostAddress("eth0", 1, false), 21, hostAddress("eth0", FIRST_HOST, false)};
-    writeFile("/usr/veld/etc/firewall.d/1.json", R"({"name": "default", "adapterPolicyMap": {"eth0": 0}})");
-    writeFile("/usr/veld/etc/firewall.d/2.json", R"({"name": "closed", "adapterPolicyMap": {"eth0": 1}})");
+/// Two hosts, each with a connection that the active profile lets through, and trials of one that denies.
+class TrialOnKernel : public PacketsOnKernel {
+protected:
+    static constexpr std::chrono::seconds UNTIL_SENT_AGAIN{60};  // TCP waits longer after each lost packet
+
+    void SetUp() override {
+        PacketsOnKernel::SetUp();
+        if (IsSkipped()) {
+            return;
+        }
+        writeFile("/usr/veld/etc/firewall.d/1.json", R"({"name": "default", "adapterPolicyMap": {"eth0": 0}})");
+        writeFile("/usr/veld/etc/firewall.d/2.json", R"({"name": "closed", "adapterPolicyMap": {"eth0": 1}})");
+        ASSERT_TRUE(FW::VELDFW().fwReload(true));
+        for (const ProbeTarget &target : m_targets) {
+            m_connections.emplace_back(target, &m_client);
+            ASSERT_EQ(ProbeResult::connected, m_connections.back().exchange());
+        }
+    }
+    void tryProfile(const std::vector<FW::FWRULE> &rules, const std::string &client) {
+        FW::VELDFW_PROFILE profiles;
+        ASSERT_TRUE(
+            profiles.CreateTestProfile("closed", {"closed", {{"eth0", rules}}, {{"eth0", FW::FW_POLICY_DENY}}}));
+        ASSERT_TRUE(FW::VELDFW().TestApplyingProfile("closed", client));
+        ASSERT_TRUE(profiles.RemoveTestProfile("closed"));
+    }
+    void expectConnections(bool testers, bool others) {
+        for (const auto &[connection, lives] : {std::pair(0, testers), {1, others}}) {
+            EXPECT_EQ(lives ? ProbeResult::connected : ProbeResult::timedOut,
+                      m_connections[connection].exchange(lives ? UNTIL_SENT_AGAIN : probeTimeout));
+        }
+    }
+    void expectNewConnections(bool testers, bool others) {
+        for (const auto &[target, connects] : {std::pair(0, testers), {1, others}}) {
+            EXPECT_EQ(connects ? ProbeResult::connected : ProbeResult::timedOut,
+                      probeTcp(m_targets[target], &m_client));
+        }
+    }
+
+    const std::string m_tester = hostAddress("eth0", FIRST_HOST, false);
+    const ProbeTarget m_targets[2] = {{hostAddress("eth0", 1, false), 21, m_tester},
+                                      {hostAddress("eth0", 1, false), 21, hostAddress("eth0", LAST_HOST, false)}};
+    std::vector<Connection> m_connections;
+};
+
+TEST_F(TrialOnKernel, CutsOffTheClientsConnectionOnlyUnlessTheProfileLetsItLive) {
+    tryProfile({}, m_tester);
+    expectConnections(false, true);
+    expectNewConnections(false, false);
     ASSERT_TRUE(FW::VELDFW().fwReload(true));
-    Connection connection(target, &m_client);
-    ASSERT_EQ(ProbeResult::connected, connection.exchange());
-    ASSERT_EQ(0, runTool({"try", "closed", "--timeout", "4", "--client", target.source}).status);
-    EXPECT_EQ(ProbeResult::timedOut, connection.exchange());
-    EXPECT_EQ(ProbeResult::timedOut, probeTcp(target, &m_client));
-    EXPECT_EQ(ProbeResult::connected, connection.exchange(std::chrono::seconds(60)));
-    EXPECT_EQ(ProbeResult::connected, probeTcp(target, &m_client));
+    expectNewConnections(true, true);
+    FW::FWRULE rule;
+    rule.ipList = {m_tester};
+    rule.portGroup = FW::FW_PORT_GROUP_PORT;
+    rule.portList = {"21"};
+    tryProfile({rule}, m_tester);
+    expectConnections(true, true);
+    expectNewConnections(true, false);
+}
+
+TEST_F(TrialOnKernel, WithoutAClientCutsOffEverybodyUntilTheFirewallIsEnabled) {
+    ASSERT_TRUE(FW::VELDFW().fwDisable());
+    tryProfile({}, "");
+    expectConnections(false, false);
+    expectNewConnections(false, false);
+    ASSERT_TRUE(FW::VELDFW().fwEnable());
+    expectNewConnections(true, true);
+}
+
+TEST_F(TrialOnKernel, ByTheToolGivesTheConnectionBackAtItsEnd) {
+    ASSERT_EQ(0, runTool({"try", "closed", "--timeout", "5", "--client", m_tester}).status);
+    expectConnections(false, true);
+    expectConnections(true, true);
+    expectNewConnections(true, true);
 }
 
 }  // namespace
