@@ -13,7 +13,7 @@
 //   % delay MILLISECONDS   each command of the next run lasts that long
 //   % kernel               from now on the machine's own iptables are run, on the sandbox's network
 //   % need PROGRAM         skips the rest where the machine does not have it
-//   % write PATH TEXT      writes a file
+//   % write PATH TEXT      writes a file; "\n" in the text stands for the end of a line
 //   % remove PATH
 #include <json/value.h>
 
@@ -21,6 +21,7 @@
 #include <filesystem>
 #include <fstream>
 #include <optional>
+#include <regex>
 
 #include "caseTable.h"
 #include "commandRecorder.h"
@@ -170,7 +171,8 @@ private:
             m_failures.emplace_back(rest.substr(0, middle), rest.substr(middle + 4));
             m_recorder->failMatching(m_failures.back().first, 2, m_failures.back().second);
         } else if (verb == "write") {
-            writeFile(rest.substr(0, rest.find(' ')), rest.substr(rest.find(' ') + 1));
+            const std::string body = rest.substr(rest.find(' ') + 1);
+            writeFile(rest.substr(0, rest.find(' ')), std::regex_replace(body, std::regex(R"(\\n)"), "\n"));
         } else if (verb == "delay") {
             m_recorder->setDelay(static_cast<unsigned>(std::stoul(rest)));
         } else if (verb == "remove") {
@@ -229,6 +231,12 @@ TEST_F(ToolTest, EveryCommandOfTheAdministratorsGuideWorks) {
     removeAll("/usr/veld/etc/firewall.d");
     writeFile("/usr/veld/etc.defaults/firewall.d/1.json", readFile(VELD_DATA_DIR "/firewall.d/1.json"));
     makeDirectories("/root");
+    // What another firewall manager would have installed, and nothing else of that kind.
+    for (const char *directory : {"/etc/firewalld", "/usr/lib/firewalld", "/etc/ufw"}) {
+        removeAll(directory);
+    }
+    writeFile("/usr/lib/firewalld/services/samba.xml", R"(<service><port port="137-138" protocol="udp"/>
+        <port port="139" protocol="tcp"/><port port="445" protocol="tcp"/><helper name="netbios-ns"/></service>)");
     int commands = 0;
     bool isInBlock = false;
     for (const std::string &line : split(readFile(VELD_DATA_DIR "/../docs/administration.md"), '\n')) {
