@@ -14,7 +14,6 @@ namespace veldtest {
 
 inline const std::string profileDirectory = "/usr/veld/etc/firewall.d/";
 inline const std::string settingsFile = profileDirectory + "firewall_settings.json";
-inline const std::string moduleStateFile = "/tmp/iptables_serv_mod_list";
 
 /// Writes the settings file.
 void storeSettings(bool enabled, const std::string &profile);
