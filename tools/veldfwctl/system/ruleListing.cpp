@@ -4,10 +4,12 @@
 
 #include <sched.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <exception>
 #include <filesystem>
+#include <iterator>
 #include <thread>
 
 #include "frame/errors.h"
@@ -42,7 +44,11 @@ std::string liveListing(bool isV6) {
 }
 
 std::string plannedListing(const std::vector<std::string> &commands, bool isV6) {
-    const std::string text = restoreTextWrite(commands);
+    // Rules of other tables are not listed, and their chains are missing in a network of its own.
+    std::vector<std::string> filterCommands;
+    std::copy_if(commands.begin(), commands.end(), std::back_inserter(filterCommands),
+                 [](const std::string &command) { return commandWordsSplit(command).table == "filter"; });
+    const std::string text = restoreTextWrite(filterCommands);
     std::string listing;
     std::exception_ptr failure;
     // A namespace belongs to a thread, and what the thread starts is in it too.
