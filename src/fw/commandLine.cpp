@@ -2,7 +2,8 @@
 // Splits a command line into an argument vector of fixed size.
 #include "fw/commandLine.h"
 
-#include <cstdio>
+#include <algorithm>
+#include <string_view>
 
 namespace FW {
 
@@ -16,7 +17,7 @@ CommandSplit commandLineSplit(const std::string &commandLine, CommandArguments &
         if (end == std::string::npos) {
             end = commandLine.size();
         }
-        const std::string piece = commandLine.substr(begin, end - begin);
+        const std::string_view piece = std::string_view(commandLine).substr(begin, end - begin);
         begin = end + 1;
         if (piece.empty()) {
             continue;
@@ -25,7 +26,8 @@ CommandSplit commandLineSplit(const std::string &commandLine, CommandArguments &
             return CommandSplit::TOO_MANY;
         }
         char *const argument = arguments.text.data() + used;
-        std::snprintf(argument, arguments.text.size() - used, "%s", piece.c_str());
+        const size_t room = arguments.text.size() - used - 1;
+        argument[piece.copy(argument, std::min(piece.size(), room))] = '\0';
         arguments.vector[arguments.count++] = argument;
         used += piece.size() + 1;
     }

@@ -1,7 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 // Applying a command list as a whole: everything new, or everything as it was.
 #include <algorithm>
+#include <memory>
 #include <optional>
+#include <utility>
 
 #include "fw/commandList.h"
 #include "fw/commandOrigin.h"
@@ -26,35 +28,34 @@ constexpr const char *LOCK_OF_ITS_OWN = "XTABLES_LOCKFILE=/proc/self/fd/0";
 /// One family's half of an atomic apply.
 class FamilyApply {
 public:
-    FamilyApply(const char *familyName, const char *programName) : family(familyName), program(programName) {}
+    /// Starts to list the rules in force, while the caller makes those to come.
+    FamilyApply(const char *familyName, const char *programName)
+        : family(familyName), program(programName),
+          filterListing(std::make_unique<StartedProgram>(ProgramCall{saveCommand(FILTER_TABLE), ""})) {}
 
     const std::string &familyName() const { return family; }
 
+    /// Writes the input, and starts what shows whether commit() can succeed and be undone: a run that reads everything
+    /// and commits nothing, and the lists of the rules in force in other tables. None changes anything.
     /// @return false, with the failure told, when a command cannot be part of a transaction
-    bool prepare(std::vector<ListedCommand> listed, FwApplyFailure &failure) {
+    bool trialStart(std::vector<ListedCommand> listed, FwApplyFailure &failure) {
         commands = std::move(listed);
         const std::optional<RestoreRefusal> refusal = restoreInputWrite(commands, input);
         if (refusal) {
             commandTell(refusal->command, refusal->reason, failure);
+            return false;
         }
-        return !refusal;
+        trial = std::make_unique<StartedProgram>(ProgramCall{restoreCommand({"--test"}), input.text, LOCK_OF_ITS_OWN});
+        listings = listingsStart(1);
+        return true;
     }
 
-    /// The programs that show whether commit() can succeed and be undone: one that reads everything and commits
-    /// nothing, and those that list the rules in force. None changes anything.
-    std::vector<ProgramCall> trial() const {
-        std::vector<ProgramCall> calls = {{restoreCommand({"--test"}), input.text, LOCK_OF_ITS_OWN}};
-        for (const std::string &table : input.tables) {
-            calls.push_back({saveCommand(table), ""});
-        }
-        return calls;
-    }
-
-    /// Takes the results of trial(), from `run` on, and keeps what undo() puts back.
-    /// @param run moves on behind them
-    bool trialRead(std::vector<ProgramRun>::const_iterator &run, FwApplyFailure &failure) {
-        const ProgramRun &tried = *run++;
-        const std::string message = savedRead(run, snapshot);
+    /// Waits for that, and keeps what undo() puts back.
+    bool trialSucceeds(FwApplyFailure &failure) {
+        const ProgramRun tried = trial->wait();
+        std::string message;
+        listingRead(*filterListing, snapshot, message);
+        listingsRead(listings, snapshot, message);
         if (!message.empty()) {
             failure.family = family;
             failure.message = message;
@@ -72,14 +73,9 @@ public:
     /// Puts back what commit() changed, all or some of it. A failure is only logged: there is nothing left to go back
     /// to.
     void undo() const {
-        std::vector<ProgramCall> saves;
-        for (const std::string &table : input.tables) {
-            saves.push_back({saveCommand(table), ""});
-        }
-        const std::vector<ProgramRun> saved = programsRun(saves);
-        auto run = saved.begin();
         std::string now;
-        const std::string message = savedRead(run, now);
+        std::string message;
+        listingsRead(listingsStart(0), now, message);
         if (!message.empty()) {
             FW_LOG_ERR("Failed to list the rules of %s: %s", program.c_str(), message.c_str());
         }
@@ -98,6 +94,9 @@ private:
     std::string program;
     std::vector<ListedCommand> commands;
     RestoreInput input;
+    std::unique_ptr<StartedProgram> filterListing;
+    std::unique_ptr<StartedProgram> trial;
+    std::vector<std::unique_ptr<StartedProgram>> listings;  ///< of the other tables
     std::string snapshot;
 
     std::vector<std::string> restoreCommand(const std::vector<std::string> &options) const {
@@ -111,16 +110,29 @@ private:
         return {program + "-save", "--counters", "--table", table};
     }
 
-    /// Takes the results of saveCommand() for each table. @return why not, or nothing
-    std::string savedRead(std::vector<ProgramRun>::const_iterator &run, std::string &saved) const {
-        std::string message;
-        for (size_t table = 0; table < input.tables.size(); ++table, ++run) {
-            if (!run->succeeded && message.empty()) {
-                message = program + "-save: " + run->message;
-            }
-            saved += run->output;
+    /// Lists the rules in force in the tables of the input, from the `first` on.
+    std::vector<std::unique_ptr<StartedProgram>> listingsStart(size_t first) const {
+        std::vector<std::unique_ptr<StartedProgram>> started;
+        for (size_t table = first; table < input.tables.size(); ++table) {
+            started.push_back(std::make_unique<StartedProgram>(ProgramCall{saveCommand(input.tables[table]), ""}));
         }
-        return message;
+        return started;
+    }
+
+    /// Adds what a listing prints to `saved`, or, unless there is one, to `message` why there is nothing.
+    void listingRead(StartedProgram &listing, std::string &saved, std::string &message) const {
+        const ProgramRun run = listing.wait();
+        if (!run.succeeded && message.empty()) {
+            message = program + "-save: " + run.message;
+        }
+        saved += run.output;
+    }
+
+    void listingsRead(const std::vector<std::unique_ptr<StartedProgram>> &started, std::string &saved,
+                      std::string &message) const {
+        for (const std::unique_ptr<StartedProgram> &listing : started) {
+            listingRead(*listing, saved, message);
+        }
     }
 
     bool restored(const ProgramRun &run, FwApplyFailure &failure) const {
@@ -174,17 +186,10 @@ private:
 
 /// Both families, up to the commits of both or of none.
 bool allOrNothing(std::vector<FamilyApply> &families, FwApplyFailure &failure) {
-    // Side by side: each program spends its time reading or printing rules, on one processor.
-    std::vector<ProgramCall> calls;
-    for (const FamilyApply &family : families) {
-        const std::vector<ProgramCall> trial = family.trial();
-        calls.insert(calls.end(), trial.begin(), trial.end());
-    }
-    const std::vector<ProgramRun> runs = programsRun(calls);
-    auto run = runs.begin();
-    const auto tried = [&](FamilyApply &family) { return family.trialRead(run, failure); };
-    if (!std::all_of(families.begin(), families.end(), tried)) {
-        return false;
+    for (FamilyApply &family : families) {
+        if (!family.trialSucceeds(failure)) {
+            return false;
+        }
     }
     for (size_t i = 0; i < families.size(); ++i) {
         if (families[i].commit(failure)) {
@@ -199,18 +204,23 @@ bool allOrNothing(std::vector<FamilyApply> &families, FwApplyFailure &failure) {
     return true;
 }
 
-bool commandListApply(const Json::Value &commandList, FwApplyFailure &failure) {
+/// The families that a command list can have commands for, with the programs that they are for.
+constexpr std::pair<const char *, const char *> FAMILY_PROGRAMS[] = {{FAMILY_V4, IPTABLES_PROGRAM},
+                                                                     {FAMILY_V6, IP6TABLES_PROGRAM}};
+
+/// @param families all that the list has commands for; others are left alone
+bool commandListApply(const Json::Value &commandList, std::vector<FamilyApply> families, FwApplyFailure &failure) {
     const std::vector<ListedCommand> commands = commandsInOrder(commandList);
-    std::vector<FamilyApply> families;
-    for (const auto &[family, program] :
-         {std::pair(FAMILY_V4, IPTABLES_PROGRAM), std::pair(FAMILY_V6, IP6TABLES_PROGRAM)}) {
-        if (!commandList.isMember(family)) {
-            continue;
-        }
+    families.erase(
+        std::remove_if(families.begin(), families.end(),
+                       [&](const FamilyApply &family) { return !commandList.isMember(family.familyName()); }),
+        families.end());
+    // Side by side: each program spends its time reading or printing rules, on one processor.
+    for (FamilyApply &family : families) {
         std::vector<ListedCommand> ofFamily;
         std::copy_if(commands.begin(), commands.end(), std::back_inserter(ofFamily),
-                     [name = std::string(family)](const ListedCommand &command) { return command.family == name; });
-        if (!families.emplace_back(family, program).prepare(std::move(ofFamily), failure)) {
+                     [&family](const ListedCommand &command) { return command.family == family.familyName(); });
+        if (!family.trialStart(std::move(ofFamily), failure)) {
             return false;
         }
     }
@@ -245,7 +255,13 @@ void originTell(const FWPROFILE &profile, FwApplyFailure &failure) {
 
 bool VELDFW::fwExecAtomic(const Json::Value &commandList, FwApplyFailure &failure) {
     FwApplyFailure found;
-    if (commandListApply(commandList, found)) {
+    std::vector<FamilyApply> families;
+    for (const auto &[family, program] : FAMILY_PROGRAMS) {
+        if (commandList.isMember(family)) {
+            families.emplace_back(family, program);
+        }
+    }
+    if (commandListApply(commandList, std::move(families), found)) {
         return true;
     }
     failureLog(found);
@@ -285,6 +301,10 @@ bool VELDFW::fwReloadAtomic(bool keepEstablished, FwApplyFailure &failure) {
     if (!fwProfileConfigGet(found.profile)) {
         return fail("Failed to fwProfileConfigGet()");
     }
+    std::vector<FamilyApply> families;  // already now: reading the profile and listing the old rules take as long
+    for (const auto &[family, program] : FAMILY_PROGRAMS) {
+        families.emplace_back(family, program);
+    }
     FWPROFILE profile;
     if (!VELDFW_PROFILE().profileGet(found.profile, profile)) {
         return fail("Failed to profileGet()");
@@ -298,7 +318,7 @@ bool VELDFW::fwReloadAtomic(bool keepEstablished, FwApplyFailure &failure) {
     if (!translator.fwRulesToIptablesRules(keepEstablished, profile.rules, profile.adapterPolicyMap, commands)) {
         return fail("Failed to fwRulesToIptablesRules()");
     }
-    if (!commandListApply(commands, found)) {
+    if (!commandListApply(commands, std::move(families), found)) {
         originTell(profile, found);
         failureLog(found);
         failure = found;

@@ -13,6 +13,7 @@
 #include <csignal>
 #include <cstring>
 #include <memory>
+#include <utility>
 
 #include "utils/descriptor.h"
 
@@ -71,80 +72,61 @@ int spawn(const ProgramCall &call, int in, int out, int err, pid_t &process) {
     return error;
 }
 
-/// A program on its way. Its end must be waited for.
-class StartedProgram {
-public:
-    explicit StartedProgram(const ProgramCall &call)
-        : in(memoryFile("input")), out(memoryFile("output")), err(memoryFile("errors")),
-          inputSize(static_cast<off_t>(call.input.size())) {
-        if (!in.isOpen() || !out.isOpen() || !err.isOpen() || !writeAll(in.get(), call.input) ||
-            lseek(in.get(), 0, SEEK_SET) != 0) {
-            reason = std::string("no memory for its input and output: ") + std::strerror(errno);
-        } else if (const int error = spawn(call, in.get(), out.get(), err.get(), process); error != 0) {
-            process = -1;
-            reason = std::string("cannot be started: ") + std::strerror(error);
-        }
-    }
+}  // namespace
 
-    ProgramRun wait() const {
-        ProgramRun run;
-        run.message = reason;
-        if (process < 0) {
-            return run;
-        }
-        int status = 0;
-        while (waitpid(process, &status, 0) < 0) {
-            if (errno != EINTR) {
-                run.message = std::string("its exit status is lost: ") + std::strerror(errno);
-                return run;
-            }
-        }
-        if (!contentRead(out, run.output) || !contentRead(err, run.message)) {
-            run.message = std::string("what it printed is lost: ") + std::strerror(errno);
-            return run;
-        }
-        run.succeeded = status == 0;
-        run.message.erase(run.message.find_last_not_of(" \n") + 1);
-        if (WIFSIGNALED(status)) {
-            run.message += " (killed by signal " + std::to_string(WTERMSIG(status)) + ")";
-        } else if (run.message.empty() && status != 0) {
-            run.message = "exited with status " + std::to_string(WEXITSTATUS(status));
-        }
-        // iptables-restore takes an input that it cannot read for an empty one, and succeeds. The offset is shared.
-        if (run.succeeded && lseek(in.get(), 0, SEEK_CUR) != inputSize) {
-            run.succeeded = false;
-            run.message += "ended before it had read all of its input";
-        }
+StartedProgram::StartedProgram(const ProgramCall &call)
+    : in(memoryFile("input")), out(memoryFile("output")), err(memoryFile("errors")),
+      inputSize(static_cast<off_t>(call.input.size())) {
+    if (!in.isOpen() || !out.isOpen() || !err.isOpen() || !writeAll(in.get(), call.input) ||
+        lseek(in.get(), 0, SEEK_SET) != 0) {
+        reason = std::string("no memory for its input and output: ") + std::strerror(errno);
+    } else if (const int error = spawn(call, in.get(), out.get(), err.get(), process); error != 0) {
+        process = -1;
+        reason = std::string("cannot be started: ") + std::strerror(error);
+    }
+}
+
+StartedProgram::~StartedProgram() {
+    if (process >= 0) {
+        wait();
+    }
+}
+
+ProgramRun StartedProgram::wait() {
+    ProgramRun run;
+    run.message = reason;
+    if (process < 0) {
         return run;
     }
-
-private:
-    Descriptor in;
-    Descriptor out;
-    Descriptor err;
-    off_t inputSize;
-    pid_t process = -1;
-    std::string reason;  ///< why it was not started
-};
-
-}  // namespace
+    int status = 0;
+    const pid_t waited = std::exchange(process, -1);
+    while (waitpid(waited, &status, 0) < 0) {
+        if (errno != EINTR) {
+            run.message = std::string("its exit status is lost: ") + std::strerror(errno);
+            return run;
+        }
+    }
+    if (!contentRead(out, run.output) || !contentRead(err, run.message)) {
+        run.message = std::string("what it printed is lost: ") + std::strerror(errno);
+        return run;
+    }
+    run.succeeded = status == 0;
+    run.message.erase(run.message.find_last_not_of(" \n") + 1);
+    if (WIFSIGNALED(status)) {
+        run.message += " (killed by signal " + std::to_string(WTERMSIG(status)) + ")";
+    } else if (run.message.empty() && status != 0) {
+        run.message = "exited with status " + std::to_string(WEXITSTATUS(status));
+    }
+    // iptables-restore takes an input that it cannot read for an empty one, and succeeds. The offset is shared.
+    if (run.succeeded && lseek(in.get(), 0, SEEK_CUR) != inputSize) {
+        run.succeeded = false;
+        run.message += "ended before it had read all of its input";
+    }
+    return run;
+}
 
 ProgramRun programRun(const ProgramCall &call) {
     return StartedProgram(call).wait();
-}
-
-std::vector<ProgramRun> programsRun(const std::vector<ProgramCall> &calls) {
-    std::vector<std::unique_ptr<StartedProgram>> started;
-    started.reserve(calls.size());
-    for (const ProgramCall &call : calls) {
-        started.push_back(std::make_unique<StartedProgram>(call));
-    }
-    std::vector<ProgramRun> runs;
-    runs.reserve(calls.size());
-    for (const std::unique_ptr<StartedProgram> &program : started) {
-        runs.push_back(program->wait());
-    }
-    return runs;
 }
 
 }  // namespace FW

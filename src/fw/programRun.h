@@ -3,8 +3,12 @@
 #ifndef VELDFIREWALL_SRC_PROGRAMRUN_H
 #define VELDFIREWALL_SRC_PROGRAMRUN_H
 
+#include <sys/types.h>
+
 #include <string>
 #include <vector>
+
+#include "utils/descriptor.h"
 
 namespace FW {
 
@@ -21,11 +25,29 @@ struct ProgramCall {
     const char *setting = nullptr;  ///< "NAME=value", added to this process's environment
 };
 
-/// Runs a program without a shell and waits for it. It inherits no descriptors beyond 0 to 2.
-ProgramRun programRun(const ProgramCall &call);
+/// A program on its way, run without a shell. It inherits no descriptors beyond 0 to 2.
+class StartedProgram {
+public:
+    explicit StartedProgram(const ProgramCall &call);
+    /// Waits for its end if nobody has.
+    ~StartedProgram();
+    StartedProgram(const StartedProgram &) = delete;
+    StartedProgram &operator=(const StartedProgram &) = delete;
 
-/// Runs all of them at the same time, each as programRun() does, and waits for all. @return the results in order
-std::vector<ProgramRun> programsRun(const std::vector<ProgramCall> &calls);
+    /// Waits for its end. To be called once.
+    ProgramRun wait();
+
+private:
+    Descriptor in;
+    Descriptor out;
+    Descriptor err;
+    off_t inputSize;
+    pid_t process = -1;  ///< -1: not started, or waited for
+    std::string reason;  ///< why it was not started
+};
+
+/// Runs a program and waits for it.
+ProgramRun programRun(const ProgramCall &call);
 
 }  // namespace FW
 

@@ -16,12 +16,11 @@ namespace FW {
 
 namespace {
 
-constexpr const char *FILTER_TABLE = "filter";
-
 struct Append {
     size_t command;  ///< index in the commands given
     std::string table;
-    std::vector<std::string> arguments;  ///< chain and what follows "-A"
+    std::string chain;
+    std::string rule;  ///< chain and what follows, as they stand behind "-A "
 };
 
 /// Options with which iptables-restore means something else than iptables, or nothing at all: the table, which belongs
@@ -32,7 +31,7 @@ constexpr std::array<std::string_view, 8> FOREIGN_OPTIONS = {"table",         "i
 constexpr std::string_view FOREIGN_LETTERS = "t46wWMhV";
 constexpr std::string_view FLAG_LETTERS = "fbvnx";  // other letters may follow these in the same argument
 
-bool isForeignOption(const std::string &argument) {
+bool isForeignOption(std::string_view argument) {
     if (argument.size() < 2 || argument[0] != '-') {
         return false;
     }
@@ -40,53 +39,72 @@ bool isForeignOption(const std::string &argument) {
         const bool bundle = argument.size() > 2 && FLAG_LETTERS.find(argument[1]) != std::string_view::npos;
         return bundle || FOREIGN_LETTERS.find(argument[1]) != std::string_view::npos;
     }
-    const std::string_view name = std::string_view(argument).substr(2, argument.find('=') - 2);
+    const std::string_view name = argument.substr(2, argument.find('=') - 2);
     // Any beginning of a long option stands for it.
     return !name.empty() && std::any_of(FOREIGN_OPTIONS.begin(), FOREIGN_OPTIONS.end(),
                                         [&](std::string_view option) { return option.substr(0, name.size()) == name; });
 }
 
-bool isTableName(const std::string &table) {
+/// Characters that iptables-restore reads as they are, wherever they stand.
+constexpr std::array<bool, 256> plainCharacters() {
+    std::array<bool, 256> plain = {};
+    for (const char c : std::string_view("ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789-_.,:/!+=@%")) {
+        plain[static_cast<unsigned char>(c)] = true;
+    }
+    return plain;
+}
+
+void quotedAppend(std::string &text, std::string_view argument) {
+    static constexpr std::array<bool, 256> PLAIN = plainCharacters();
+    if (!argument.empty() && std::all_of(argument.begin(), argument.end(), [](unsigned char c) { return PLAIN[c]; })) {
+        text += argument;
+        return;
+    }
+    text += '"';
+    for (const char c : argument) {
+        if (c == '"' || c == '\\') {
+            text += '\\';
+        }
+        text += c;
+    }
+    text += '"';
+}
+
+bool isTableName(std::string_view table) {
     return !table.empty() &&
            std::all_of(table.begin(), table.end(), [](unsigned char c) { return std::isalnum(c) != 0 || c == '_'; });
 }
 
 std::optional<std::string> appendRead(const std::string &commandLine, Append &append) {
-    if (commandLine.find_first_of(std::string("\n\0", 2)) != std::string::npos) {
+    if (commandLine.find('\n') != std::string::npos || commandLine.find('\0') != std::string::npos) {
         return "a line break or NUL in it would end the line";
     }
     CommandArguments arguments;
     if (commandLineSplit(commandLine, arguments) != CommandSplit::OK) {
         return "it has no arguments, or more than a command can hold";
     }
-    std::vector<std::string> words(arguments.vector.begin() + 1,
-                                   arguments.vector.begin() + static_cast<long>(arguments.count));
+    std::vector<std::string_view> words(arguments.vector.begin() + 1,
+                                        arguments.vector.begin() + static_cast<long>(arguments.count));
     append.table = FILTER_TABLE;
     if (words.size() >= 2 && words[0] == "-t") {
-        append.table = words[1];
-        words.erase(words.begin(), words.begin() + 2);
-        if (!isTableName(append.table)) {
+        if (!isTableName(words[1])) {
             return "it names no table";
         }
+        append.table = words[1];
+        words.erase(words.begin(), words.begin() + 2);
     }
     if (words.size() < 2 || words[0] != "-A") {
         return "it does not append a rule";
     }
-    append.arguments.assign(words.begin() + 1, words.end());
-    const auto foreign = std::find_if(append.arguments.begin(), append.arguments.end(), isForeignOption);
-    if (foreign != append.arguments.end()) {
-        return "iptables-restore reads \"" + *foreign + "\" differently";
+    append.chain = words[1];
+    for (auto word = words.begin() + 1; word != words.end(); ++word) {
+        if (isForeignOption(*word)) {
+            return "iptables-restore reads \"" + std::string(*word) + "\" differently";
+        }
+        append.rule += append.rule.empty() ? "" : " ";
+        quotedAppend(append.rule, *word);
     }
     return std::nullopt;
-}
-
-std::string argumentsText(const std::vector<std::string> &arguments) {
-    std::string text;
-    for (const std::string &argument : arguments) {
-        text += text.empty() ? "" : " ";
-        text += restoreQuoted(argument);
-    }
-    return text;
 }
 
 void lineAppend(RestoreInput &input, const std::string &line, size_t command = RestoreInput::NO_COMMAND) {
@@ -109,10 +127,9 @@ void sectionAppend(RestoreInput &input, const std::string &table, const std::vec
         if (append.table != table) {
             continue;
         }
-        const std::string rule = argumentsText(append.arguments);
-        lineAppend(input, "-A " + rule, append.command);
-        if (!isFirewallChain(table, append.arguments[0])) {
-            input.foreignRules.push_back({table, append.arguments[0], rule});
+        lineAppend(input, "-A " + append.rule, append.command);
+        if (!isFirewallChain(table, append.chain)) {
+            input.foreignRules.push_back({table, append.chain, append.rule});
         }
     }
     lineAppend(input, "COMMIT");
@@ -120,20 +137,20 @@ void sectionAppend(RestoreInput &input, const std::string &table, const std::vec
 
 /// The lines of what iptables-save prints; a line break in quotes belongs to the line.
 std::vector<std::string> savedLines(const std::string &saved) {
-    std::vector<std::string> lines(1);
+    std::vector<std::string> lines;
     bool quoted = false;
+    size_t begin = 0;
     for (size_t i = 0; i < saved.size(); ++i) {
-        if (saved[i] == '\n' && !quoted) {
-            lines.emplace_back();
-            continue;
-        }
-        lines.back() += saved[i];
-        if (quoted && saved[i] == '\\' && i + 1 < saved.size()) {
-            lines.back() += saved[++i];
-        } else if (saved[i] == '"') {
+        if (saved[i] == '"') {
             quoted = !quoted;
+        } else if (saved[i] == '\\' && quoted) {
+            ++i;
+        } else if (saved[i] == '\n' && !quoted) {
+            lines.push_back(saved.substr(begin, i - begin));
+            begin = i + 1;
         }
     }
+    lines.push_back(saved.substr(begin));
     return lines;
 }
 
@@ -215,21 +232,9 @@ std::optional<RestoreRefusal> restoreInputWrite(const std::vector<ListedCommand>
 }
 
 std::string restoreQuoted(const std::string &argument) {
-    const bool plain = !argument.empty() && std::all_of(argument.begin(), argument.end(), [](unsigned char c) {
-        return std::isalnum(c) != 0 ||
-               std::string_view("-_.,:/!+=@%").find(static_cast<char>(c)) != std::string_view::npos;
-    });
-    if (plain) {
-        return argument;
-    }
-    std::string quoted = "\"";
-    for (const char c : argument) {
-        if (c == '"' || c == '\\') {
-            quoted += '\\';
-        }
-        quoted += c;
-    }
-    return quoted + "\"";
+    std::string quoted;
+    quotedAppend(quoted, argument);
+    return quoted;
 }
 
 size_t restoreFailedLine(const std::string &printed) {
@@ -264,14 +269,14 @@ std::string RestoreInput::line(size_t number) const {
 
 bool savedRulesHoldLineBreak(const std::string &saved) {
     const SavedTables tables(saved);
-    for (const char *chain : FW_CHAINS) {
-        for (const std::string &rule : tables.rules(FILTER_TABLE, chain, false)) {
-            if (rule.find('\n') != std::string::npos) {
-                return true;
-            }
-        }
+    const auto holdsLineBreak = [](const std::string &line) { return line.find('\n') != std::string::npos; };
+    if (std::none_of(tables.lines.begin(), tables.lines.end(), holdsLineBreak)) {
+        return false;
     }
-    return false;
+    return std::any_of(FW_CHAINS.begin(), FW_CHAINS.end(), [&](const char *chain) {
+        const std::vector<std::string> rules = tables.rules(FILTER_TABLE, chain, false);
+        return std::any_of(rules.begin(), rules.end(), holdsLineBreak);
+    });
 }
 
 std::string restoreInputOfUndo(const RestoreInput &input, const std::string &before, const std::string &now) {

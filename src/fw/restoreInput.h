@@ -11,6 +11,9 @@
 
 namespace FW {
 
+/// The table of the firewall chains.
+inline constexpr const char *FILTER_TABLE = "filter";
+
 /// One family's commands as one input of iptables-restore --noflush.
 struct RestoreInput {
     /// A rule that is not in the firewall chains: it is appended, and nothing is flushed for it.
