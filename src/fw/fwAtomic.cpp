@@ -1,5 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // Applying a command list as a whole: everything new, or everything as it was.
+#include <unistd.h>
+
 #include <algorithm>
 #include <memory>
 #include <optional>
@@ -25,6 +27,14 @@ constexpr const char *SCRATCH_NETWORK_PROGRAM = "/usr/bin/unshare";
 /// all of them lock. Enough for a trial: it changes nothing, and the kernel gives it each table as of one moment.
 constexpr const char *LOCK_OF_ITS_OWN = "XTABLES_LOCKFILE=/proc/self/fd/0";
 
+/// Null, for the common lock, where there is no /proc.
+const char *trialLock() {
+    return access("/proc/self/fd/0", F_OK) == 0 ? LOCK_OF_ITS_OWN : nullptr;
+}
+
+constexpr const char *WAIT_FOR_LOCK = "--wait=10";
+constexpr const char *WAIT_LONG_FOR_LOCK = "--wait=60";  // where giving up leaves the rules half old, half new
+
 /// One family's half of an atomic apply.
 class FamilyApply {
 public:
@@ -45,7 +55,7 @@ public:
             commandTell(refusal->command, refusal->reason, failure);
             return false;
         }
-        trial = std::make_unique<StartedProgram>(ProgramCall{restoreCommand({"--test"}), input.text, LOCK_OF_ITS_OWN});
+        trial = std::make_unique<StartedProgram>(ProgramCall{restoreCommand({"--test"}), input.text, trialLock()});
         listings = listingsStart(1);
         return true;
     }
@@ -70,9 +80,9 @@ public:
         return restored(programRun({restoreCommand({}), input.text}), failure);
     }
 
-    /// Puts back what commit() changed, all or some of it. A failure is only logged: there is nothing left to go back
-    /// to.
-    void undo() const {
+    /// Puts back what commit() changed, all or some of it.
+    /// @return false when that failed, which is logged: there is nothing left to go back to
+    bool undo() const {
         std::string now;
         std::string message;
         listingsRead(listingsStart(0), now, message);
@@ -81,12 +91,13 @@ public:
         }
         const std::string text = restoreInputOfUndo(input, snapshot, now);
         if (text.empty()) {
-            return;
+            return message.empty();
         }
-        const ProgramRun undone = programRun({restoreCommand({"--counters"}), text});
+        const ProgramRun undone = programRun({restoreCommand({"--counters"}, WAIT_LONG_FOR_LOCK), text});
         if (!undone.succeeded) {
             FW_LOG_ERR("Failed to put the old rules of %s back: %s", program.c_str(), undone.message.c_str());
         }
+        return undone.succeeded;
     }
 
 private:
@@ -99,9 +110,10 @@ private:
     std::vector<std::unique_ptr<StartedProgram>> listings;  ///< of the other tables
     std::string snapshot;
 
-    std::vector<std::string> restoreCommand(const std::vector<std::string> &options) const {
+    std::vector<std::string> restoreCommand(const std::vector<std::string> &options,
+                                            const char *wait = WAIT_FOR_LOCK) const {
         // Without --wait the legacy program waits for another holder of the tables' lock for ever.
-        std::vector<std::string> command = {program + "-restore", "--noflush", "--wait=10"};
+        std::vector<std::string> command = {program + "-restore", "--noflush", wait};
         command.insert(command.end(), options.begin(), options.end());
         return command;
     }
@@ -197,7 +209,10 @@ bool allOrNothing(std::vector<FamilyApply> &families, FwApplyFailure &failure) {
         }
         // This one too: its tables are committed one by one, and it may have died after a commit.
         for (size_t changed = i + 1; changed > 0; --changed) {
-            families[changed - 1].undo();
+            if (!families[changed - 1].undo()) {
+                failure.message +=
+                    "; the old rules of " + families[changed - 1].familyName() + " could not be put back";
+            }
         }
         return false;
     }
@@ -279,7 +294,8 @@ bool VELDFW::fwReloadAtomic(bool keepEstablished, FwApplyFailure &failure) {
     const ExecLock lock;
     if (!lock.isTaken()) {
         FW_LOG_ERR("TIMEOUT: getting lock");
-        failure.message = "another process holds the lock of the kernel's rules";
+        found.message = "another process holds the lock of the kernel's rules";
+        failure = found;
         return false;
     }
     const auto fail = [&](const char *message) {

@@ -12,7 +12,6 @@
 #include <cerrno>
 #include <csignal>
 #include <cstring>
-#include <memory>
 #include <utility>
 
 #include "utils/descriptor.h"
@@ -87,8 +86,7 @@ StartedProgram::StartedProgram(const ProgramCall &call)
 }
 
 StartedProgram::~StartedProgram() {
-    if (process >= 0) {
-        wait();
+    while (process >= 0 && waitpid(process, nullptr, 0) < 0 && errno == EINTR) {
     }
 }
 

@@ -305,7 +305,9 @@ std::string definitionText(const ServiceDefinition &definition, const std::strin
     json["enabled"] = true;
     json["source"] = side(definition.sourceProtocol, definition.sourcePorts);
     json["destination"] = side(definition.destinationProtocol, definition.destinationPorts);
-    json["imported_from"] = origin;  // the registry overlooks it; a purge of the package knows its files by it
+    if (!origin.empty()) {
+        json[IMPORTED_FROM] = origin;  // the registry overlooks it; a purge of the package knows its files by it
+    }
     Json::StreamWriterBuilder builder;
     builder["indentation"] = "  ";
     builder["enableYAMLCompatibility"] = true;  // "key": value, as in the definitions that are shipped

@@ -71,8 +71,11 @@ NumberSet portSet(const std::vector<std::string> &texts);
 /// "80,1000-2000/tcp, from 68/udp".
 std::string definitionPortsText(const ServiceDefinition &definition);
 
+/// The member of a definition file that tells from where it was imported.
+inline constexpr const char *IMPORTED_FROM = "imported_from";
+
 /// The content of a definition file.
-/// @param origin the file that it comes from
+/// @param origin the file that it was imported from; empty to leave that out
 std::string definitionText(const ServiceDefinition &definition, const std::string &origin);
 
 }  // namespace veldfwctl

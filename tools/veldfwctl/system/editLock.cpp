@@ -5,6 +5,9 @@
 #include <sys/stat.h>
 #include <veld/core.h>
 
+#include <cerrno>
+#include <cstring>
+
 #include "frame/errors.h"
 #include "frame/libraryCall.h"
 #include "system/store.h"
@@ -23,8 +26,9 @@ constexpr int WAIT_SECONDS = 10;
 EditLock::EditLock() {
     mkdir(DIRECTORY, S_IRWXU);  // if it cannot be made, the lock tells
     if (VLIBCFileLockTimeByFile(LOCK, EXCLUSIVE, WAIT_SECONDS, &descriptor) == 0) {
-        throw Failure(std::string("Cannot lock ") + LOCK +
-                      "; another veldfwctl edits the profiles (see \"veldfwctl doctor\"), or this is not run as root");
+        throw Failure(std::string("Cannot lock ") + LOCK + ": " + std::strerror(errno) +
+                      "; either another veldfwctl edits the profiles (see \"veldfwctl doctor\"), or this is not run as "
+                      "root, with room on /run");
     }
 }
 

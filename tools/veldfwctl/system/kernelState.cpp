@@ -7,7 +7,7 @@ namespace veldfwctl {
 namespace {
 
 std::future<ProgramOutput> listingStart(const char *program) {
-    return std::async(std::launch::async, [program] { return programRun({program, "-w", "-v", "-S"}); });
+    return std::async(std::launch::async, [program] { return programRun({program, "-w", "10", "-v", "-S"}); });
 }
 
 }  // namespace

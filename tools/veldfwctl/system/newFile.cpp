@@ -47,6 +47,10 @@ std::string newFileWrite(std::string pattern, const std::string &text, mode_t mo
 }  // namespace
 
 void fileReplace(const std::string &path, const std::string &text, mode_t mode, const std::string &remedy) {
+    struct stat found = {};
+    if (lstat(path.c_str(), &found) == 0 && !S_ISREG(found.st_mode)) {
+        throw Failure("Cannot write " + path + ": it is no regular file; " + remedy);
+    }
     const std::string temporary = newFileWrite(path + ".XXXXXX", text, mode);
     if (temporary.empty() || std::rename(temporary.c_str(), path.c_str()) != 0) {
         const int error = errno;

@@ -9,7 +9,7 @@
 
 namespace veldfwctl {
 
-/// Replaces a file as a whole: on failure the old one stays. Only the owner may read it, unless told otherwise.
+/// Replaces a regular file as a whole: on failure the old one stays. Only the owner may read it, unless told otherwise.
 /// @param remedy what to do when it cannot be written
 /// @throws Failure
 void fileReplace(const std::string &path, const std::string &text, mode_t mode = 0600,

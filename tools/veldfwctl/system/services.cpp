@@ -30,24 +30,35 @@ std::vector<std::string> strings(const VLIBCSZLIST *list) {
     return texts;
 }
 
-/// The definition files by the name they define. The first file of a name counts, and one that cannot be read defines
-/// nothing, here as in the registry.
-std::map<std::string, std::string> definitionFiles() {
+struct DefinitionFile {
+    std::string path;
+    bool isImported = false;  ///< written by an import, not by a package or by hand
+};
+
+/// The definition files by the name they define. The first file of a name counts, and one that is no JSON defines
+/// nothing, here as in the registry, which refuses some others, too.
+std::map<std::string, DefinitionFile> definitionFiles() {
     std::set<std::string> paths;
     std::error_code error;
     for (const auto &entry : std::filesystem::directory_iterator(DEFINITIONS, error)) {
-        if (entry.path().extension() == ".json" && entry.path().filename().string().front() != '.') {
+        std::error_code gone;
+        if (entry.path().extension() == ".json" && entry.path().filename().string().front() != '.' &&
+            entry.is_regular_file(gone)) {
             paths.insert(entry.path());
         }
     }
-    std::map<std::string, std::string> files;
+    std::map<std::string, DefinitionFile> files;
     for (const std::string &path : paths) {
         std::ifstream file(path);
         Json::Value definition;
-        Json::CharReaderBuilder builder;
-        if (Json::parseFromStream(builder, file, &definition, nullptr) && definition.isObject() &&
-            definition["name"].isString()) {
-            files.emplace(definition["name"].asString(), path);
+        try {
+            Json::CharReaderBuilder builder;
+            if (Json::parseFromStream(builder, file, &definition, nullptr) && definition.isObject() &&
+                definition["name"].isString()) {
+                files.emplace(definition["name"].asString(), DefinitionFile{path, definition.isMember(IMPORTED_FROM)});
+            }
+        } catch (const Json::Exception &) {  // nested too deeply
+            continue;
         }
     }
     return files;
@@ -106,16 +117,23 @@ std::vector<Service> ServiceRegistry::all() const {
 }
 
 void definitionsWrite(const std::vector<std::pair<ServiceDefinition, std::string>> &definitions) {
-    const std::map<std::string, std::string> files = definitionFiles();
+    const std::map<std::string, DefinitionFile> files = definitionFiles();
+    const ServiceRegistry registry;
     for (const auto &[definition, origin] : definitions) {
         const auto defining = files.find(definition.name);
-        const std::string path =
-            defining != files.end() ? defining->second : std::string(DEFINITIONS) + "/" + definition.name + ".json";
+        if (defining != files.end() && !registry.find(definition.name)) {
+            throw Failure(defining->second.path + " defines service \"" + definition.name +
+                          "\", and the service registry refuses it; mend, move or remove it");
+        }
+        const std::string path = defining != files.end() ? defining->second.path
+                                                         : std::string(DEFINITIONS) + "/" + definition.name + ".json";
         if (defining == files.end() && std::filesystem::exists(std::filesystem::symlink_status(path))) {
             throw Failure(path + " is there and does not define service \"" + definition.name +
                           "\"; mend, move or remove it");
         }
-        fileReplace(path, definitionText(definition, origin), 0644,
+        // A purge takes imported files away, and must not take those of other packages or of the administrator.
+        const bool isForeign = defining != files.end() && !defining->second.isImported;
+        fileReplace(path, definitionText(definition, isForeign ? "" : origin), 0644,
                     "run this as root, and \"veldfwctl setup\" before it");
     }
 }

@@ -83,11 +83,12 @@ int list(const Context &context, const Options &options) {
 
 int add(const Context &context, const Options &options) {
     const FW::FWRULE rule = ruleFromRequest(options.request, systemKnowledge());
+    const bool isThere = adapterNames().count(options.adapter) > 0;
     size_t number = 0;
     const FW::FWPROFILE profile = profileEdit(options.profile, [&](FW::FWPROFILE &edited) {
         number = ruleInsert(edited, options.adapter, options.position, rule);
     });
-    if (adapterNames().count(options.adapter) == 0) {
+    if (!isThere) {
         context.warn("there is no adapter \"" + options.adapter + "\" now; the rule has no effect until there is");
     }
     return changeFinish(context, options, profile, "Added", number, rule);

@@ -273,7 +273,10 @@ void serviceImportAdd(CLI::App &group, Context &context) {
         ->expected(1)
         ->multi_option_policy(CLI::MultiOptionPolicy::TakeAll);
     verb->add_flag("-n,--dry-run", options->dryRun, "Tell what would be done, and do nothing");
-    verb->add_flag("--replace", options->replace, "Replace definitions that have the same name and differ");
+    verb->add_flag(
+        "--replace", options->replace,
+        "Replace definitions that have the same name and differ; one that a package brought comes back with its "
+        "next version");
 }
 
 }  // namespace veldfwctl
