@@ -55,8 +55,8 @@ public:
     /// tried first; when the second cannot be committed, the first is put back. Takes no lock.
     /// @param commandList appends only; a command that the two kinds of program would read differently is refused
     /// @param failure what stopped it; untouched on success
-    /// @return true: everything is new; false, logged: everything is as it was, or the failure's message ends with whose
-    /// old rules could not be put back
+    /// @return true: everything is new; false, logged: everything is as it was, or the failure's message ends with
+    /// whose old rules could not be put back
     bool fwExecAtomic(const Json::Value &commandList, FwApplyFailure &failure);
     /// The same for callers to whom the log is enough.
     bool fwExecAtomic(const Json::Value &commandList);
