@@ -1,8 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
 // A refused apply leaves everything as it was, and tells what stopped it.
+#include <fcntl.h>
+#include <sys/file.h>
 #include <unistd.h>
 
 #include <chrono>
+#include <csignal>
 #include <thread>
 #include <tuple>
 
@@ -135,14 +138,27 @@ TEST_P(AtomicFailure, OfTheSecondFamilyPutsTheFirstBackWithItsCounters) {
 TEST_P(AtomicFailure, OfTheLockEndsAndWaitingForItSucceeds) {
     if (std::string(GetParam()) == "nft")
         GTEST_SKIP() << "iptables-nft takes no lock";
+    const auto hold = [](unsigned seconds) {
+        const pid_t holder = startChild([seconds] {
+            return flock(open("/run/xtables.lock", O_RDWR | O_CREAT | O_CLOEXEC, 0600), LOCK_EX) +
+                   static_cast<int>(sleep(seconds));
+        });
+        std::this_thread::sleep_for(std::chrono::milliseconds(200));
+        return holder;
+    };
+    const pid_t shortHolder = hold(1);
     store(profileOf({addressRule("new", "10.0.0.1")}));
-    const pid_t holder = startChild([] {
-        execlp("flock", "flock", "/run/xtables.lock", "sleep", "0.5", nullptr);
-        return 1;
-    });
-    std::this_thread::sleep_for(std::chrono::milliseconds(200));
     EXPECT_TRUE(firewall.fwReloadAtomic(true)) << log.text();
-    EXPECT_EQ(waitForChild(holder), 0);
+    EXPECT_EQ(waitForChild(shortHolder), 0);
+
+    const pid_t holder = hold(600);
+    store(profileOf({addressRule("bad", "10.0.0.1/33")}));
+    FW::FwApplyFailure failure;
+    EXPECT_FALSE(firewall.fwReloadAtomic(true, failure));
+    EXPECT_EQ(failure.ruleName, "bad") << "the trial needs no lock: " << failure.message;
+    expectAsBefore({addressRule("new", "10.0.0.2")}, {"default", "", -1, "", "v4", "", "xtables lock"});
+    kill(holder, SIGKILL);
+    waitForChild(holder);
 }
 
 TEST_P(AtomicFailure, OfABareCommandListIsToldToo) {
