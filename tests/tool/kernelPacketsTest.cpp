@@ -257,6 +257,7 @@ TEST_F(TrialOnKernel, WithoutAClientCutsOffEverybodyUntilTheFirewallIsEnabled) {
 TEST_F(TrialOnKernel, ByTheToolGivesTheConnectionBackAtItsEnd) {
     ASSERT_EQ(0, runTool({"try", "closed", "--timeout", "5", "--client", m_tester}).status);
     expectConnections(false, true);
+    EXPECT_GE(parseJson(runTool({"status", "--json"}).output)["dropped"].asInt(), 1);
     expectConnections(true, true);
     expectNewConnections(true, true);
 }
