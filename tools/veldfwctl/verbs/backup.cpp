@@ -159,7 +159,8 @@ int importFrom(const Context &context, const Options &options) {
     const Json::Value old = configurationExport();
     const BackupChanges changes = backupCompare(old, document);
     changesPrint(context, changes);
-    if (changes.isEmpty() && old["config_profiles"] == document["config_profiles"]) {
+    const bool isSame = changes.isEmpty() && old["config_profiles"] == document["config_profiles"];
+    if (isSame) {
         context.print("Nothing to change.");
     } else {
         if (!context.confirm("Replace the configuration by that of " + options.file + "?")) {
@@ -172,7 +173,8 @@ int importFrom(const Context &context, const Options &options) {
         configurationImport(document, old);
         context.print("Imported " + options.file + ".");
     }
-    const bool applied = importApply(context, old["config_firewall_settings"]["status"].asBool(), options.apply);
+    const bool applied = (!isSame || options.apply) &&
+                         importApply(context, old["config_firewall_settings"]["status"].asBool(), options.apply);
     if (context.json) {
         Json::Value json;
         json["added"] = namesJson(changes.added);
